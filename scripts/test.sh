@@ -1,0 +1,16 @@
+#!/usr/bin/env bash
+# Installs what is missing, builds, and runs every test: the format check, a
+# bounded fuzz run of the configuration parser, the unit tests under
+# AddressSanitizer/UndefinedBehaviorSanitizer, then the unit tests of the
+# ordinary build (whose summary closes the output). Must run as root.
+set -euo pipefail
+cd "$(dirname "$0")/.."
+scripts/install-deps.sh test
+scripts/check-format.sh
+scripts/fuzz-config.sh "${FUZZ_SECONDS:-30}"
+
+scripts/build.sh build-asan -DCMAKE_BUILD_TYPE=Debug -DWITH_ASAN=ON -DWITH_BENCHMARKS=OFF
+(cd build-asan && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 ctest -j2 --output-on-failure)
+
+scripts/build.sh build -DCMAKE_BUILD_TYPE=RelWithDebInfo
+(cd build && ctest -j2 --output-on-failure)

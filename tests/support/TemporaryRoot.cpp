@@ -1,0 +1,59 @@
+#include "TemporaryRoot.h"
+
+#include <QDir>
+#include <QFile>
+#include <QFileInfo>
+
+#include <sys/stat.h>
+
+TemporaryRoot::TemporaryRoot()
+    : m_dir(QDir::tempPath() + QStringLiteral("/ftpconfig-root-XXXXXX"))
+{
+}
+
+bool TemporaryRoot::isValid() const
+{
+    return m_dir.isValid();
+}
+
+QString TemporaryRoot::path() const
+{
+    return m_dir.path();
+}
+
+QString TemporaryRoot::filePath(const QString &absolutePath) const
+{
+    return m_dir.path() + (absolutePath.startsWith(QLatin1Char('/')) ? absolutePath : QLatin1Char('/') + absolutePath);
+}
+
+bool TemporaryRoot::writeFile(const QString &absolutePath, const QByteArray &content, int mode) const
+{
+    const QString target = filePath(absolutePath);
+    if (!QDir().mkpath(QFileInfo(target).absolutePath()))
+        return false;
+    QFile file(target);
+    if (!file.open(QIODevice::WriteOnly | QIODevice::Truncate))
+        return false;
+    if (file.write(content) != content.size())
+        return false;
+    file.close();
+    return ::chmod(QFile::encodeName(target).constData(), static_cast<mode_t>(mode)) == 0;
+}
+
+QByteArray TemporaryRoot::readFile(const QString &absolutePath) const
+{
+    QFile file(filePath(absolutePath));
+    if (!file.open(QIODevice::ReadOnly))
+        return {};
+    return file.readAll();
+}
+
+bool TemporaryRoot::exists(const QString &absolutePath) const
+{
+    return QFileInfo::exists(filePath(absolutePath));
+}
+
+bool TemporaryRoot::makeDirectory(const QString &absolutePath) const
+{
+    return QDir().mkpath(filePath(absolutePath));
+}

@@ -1,0 +1,26 @@
+#pragma once
+
+#include <QByteArray>
+#include <QString>
+#include <QTemporaryDir>
+
+// A private directory that stands for "/" in a test: files are named by the
+// absolute paths the program knows them by and land below the directory.
+class TemporaryRoot
+{
+public:
+    TemporaryRoot();
+
+    bool isValid() const;
+    QString path() const;
+    QString filePath(const QString &absolutePath) const;
+
+    // Creates missing parent directories. Fails the calling test on error.
+    bool writeFile(const QString &absolutePath, const QByteArray &content, int mode = 0644) const;
+    QByteArray readFile(const QString &absolutePath) const;
+    bool exists(const QString &absolutePath) const;
+    bool makeDirectory(const QString &absolutePath) const;
+
+private:
+    QTemporaryDir m_dir;
+};
