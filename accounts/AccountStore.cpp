@@ -1,0 +1,298 @@
+#include "AccountStore.h"
+
+#include "policy/AppStrings.h"
+
+#include <QFile>
+
+#include <cstdio>
+#include <grp.h>
+#include <iostream>
+#include <pwd.h>
+
+namespace {
+
+AccountRecord recordFrom(const passwd &entry)
+{
+    AccountRecord record;
+    if (entry.pw_passwd)
+        record.password = entry.pw_passwd;
+    record.uid = entry.pw_uid;
+    record.gid = entry.pw_gid;
+    record.gecos = entry.pw_gecos;
+    record.home = entry.pw_dir;
+    record.shell = entry.pw_shell;
+    return record;
+}
+
+// Reads a file in the passwd format; false when it cannot be opened.
+bool readPasswdFile(const QString &resolvedPath, std::map<QByteArray, AccountRecord> &map)
+{
+    FILE *file = std::fopen(QFile::encodeName(resolvedPath).constData(), "r");
+    if (!file)
+        return false;
+    while (const passwd *entry = fgetpwent(file))
+        map.emplace(QByteArray(entry->pw_name), recordFrom(*entry));
+    std::fclose(file);
+    return true;
+}
+
+void reportUnopened(const QString &path)
+{
+    std::cerr << "Unable to open " << QFile::encodeName(path).constData() << std::endl;
+}
+
+} // namespace
+
+AccountStore::AccountStore(const QByteArray &databasePath, const RootDirectory &root, Access access)
+    : m_root(root)
+    , m_access(access)
+    , m_databasePath(databasePath)
+{
+    loadPasswd();
+    loadShadow();
+    loadGroups();
+    if (!databasePath.isEmpty())
+        loadVirtualUsers(databasePath);
+}
+
+AccountStore::~AccountStore() = default;
+
+void AccountStore::loadPasswd()
+{
+    if (!m_root.isSystemRoot()) {
+        const QString path = AppStrings::instance().passwdPath;
+        if (!readPasswdFile(m_root.resolve(path), m_passwd))
+            reportUnopened(path);
+        return;
+    }
+    setpwent();
+    while (const passwd *entry = getpwent())
+        m_passwd.emplace(QByteArray(entry->pw_name), recordFrom(*entry));
+    endpwent();
+}
+
+void AccountStore::loadShadow()
+{
+    // Read with the passwd parser on purpose: only the name and the second
+    // field mean anything here.
+    const QString path = AppStrings::instance().shadowPath;
+    if (!readPasswdFile(m_root.resolve(path), m_shadow))
+        reportUnopened(path);
+}
+
+void AccountStore::loadGroups()
+{
+    const QString path = AppStrings::instance().groupPath;
+    FILE *file = std::fopen(QFile::encodeName(m_root.resolve(path)).constData(), "r");
+    if (!file) {
+        reportUnopened(path);
+        return;
+    }
+    while (const group *entry = fgetgrent(file)) {
+        GroupRecord record;
+        record.name = entry->gr_name;
+        record.gid = entry->gr_gid;
+        for (char **member = entry->gr_mem; member && *member; ++member)
+            record.members.insert(QByteArray(*member));
+        m_groups.emplace(record.gid, std::move(record));
+    }
+    std::fclose(file);
+}
+
+bool AccountStore::getUserInfo(const QByteArray &name, AccountRecord &record) const
+{
+    const auto it = m_passwd.find(name);
+    if (it == m_passwd.end())
+        return false;
+    record = it->second;
+    return true;
+}
+
+QByteArray AccountStore::shadowPassword(const QByteArray &name) const
+{
+    const auto it = m_shadow.find(name);
+    return it == m_shadow.end() ? QByteArray() : it->second.password;
+}
+
+bool AccountStore::isBadPassword(const QByteArray &name) const
+{
+    for (const auto *map : {&m_passwd, &m_shadow}) {
+        const auto it = map->find(name);
+        if (it != map->end() && (it->second.password == "!" || it->second.password == "*"))
+            return true;
+    }
+    return false;
+}
+
+QList<QByteArray> AccountStore::userGroups(const QByteArray &name) const
+{
+    QList<QByteArray> result;
+    for (const auto &[gid, group] : m_groups) {
+        if (group.members.count(name))
+            result.append(group.name);
+    }
+    const auto account = m_passwd.find(name);
+    if (account == m_passwd.end())
+        return result;
+    const auto primary = m_groups.find(account->second.gid);
+    if (primary == m_groups.end()) {
+        std::cerr << "Warning: user has gid=" << account->second.gid << ", but such group could not be found"
+                  << std::endl;
+        return result;
+    }
+    result.append(primary->second.name);
+    return result;
+}
+
+bool AccountStore::isUserInGroup(const QByteArray &name, const QByteArray &groupName) const
+{
+    return userGroups(name).contains(groupName);
+}
+
+int AccountStore::groupIdByName(const QByteArray &groupName) const
+{
+    for (const auto &[gid, group] : m_groups) {
+        if (group.name == groupName)
+            return static_cast<int>(gid);
+    }
+    return -1;
+}
+
+const std::map<QByteArray, AccountRecord> &AccountStore::accounts() const
+{
+    return m_passwd;
+}
+
+const std::map<QByteArray, AccountRecord> &AccountStore::shadow() const
+{
+    return m_shadow;
+}
+
+const std::map<uint32_t, GroupRecord> &AccountStore::groups() const
+{
+    return m_groups;
+}
+
+void AccountStore::loadVirtualUsers(const QByteArray &path)
+{
+    if (!path.isEmpty() && path != m_databasePath) {
+        m_databasePath = path;
+        m_db.reset(); // the PAM file names another database
+    }
+    if (!m_db)
+        m_db = std::make_unique<VirtualUserDb>(m_databasePath, m_root, m_access);
+    m_virtualUsers.clear();
+    for (auto &[name, password] : m_db->readAll())
+        m_virtualUsers.emplace(name, VirtualUserRecord{password, {}, VirtualUserState::Unchanged});
+}
+
+bool AccountStore::isVirtualUser(const QByteArray &name) const
+{
+    return m_virtualUsers.count(name) > 0;
+}
+
+void AccountStore::addVirtualUser(const QByteArray &name, const QByteArray &password)
+{
+    const auto it = m_virtualUsers.find(name);
+    if (it == m_virtualUsers.end()) {
+        m_virtualUsers.emplace(name, VirtualUserRecord{password, {}, VirtualUserState::Added});
+    } else if (it->second.state == VirtualUserState::Deleted) {
+        it->second.password = password;
+        it->second.state = VirtualUserState::Added;
+    }
+}
+
+void AccountStore::changeVirtualUser(const QByteArray &oldName, const QByteArray &newName, const QByteArray &password)
+{
+    const auto it = m_virtualUsers.find(oldName);
+    if (it == m_virtualUsers.end())
+        return;
+    VirtualUserRecord &record = it->second;
+    if (!password.isEmpty() && password != record.password) {
+        record.password = password;
+        record.state = VirtualUserState::Modified;
+    }
+    if (newName == oldName)
+        return;
+    record.state = VirtualUserState::Modified;
+    record.previousName = oldName;
+    const VirtualUserRecord moved = record;
+    m_virtualUsers.erase(it);
+    m_virtualUsers[newName] = moved;
+}
+
+void AccountStore::removeVirtualUser(const QByteArray &name)
+{
+    const auto it = m_virtualUsers.find(name);
+    if (it != m_virtualUsers.end())
+        it->second.state = VirtualUserState::Deleted;
+}
+
+void AccountStore::syncVirtualUsers()
+{
+    if (!m_db)
+        m_db = std::make_unique<VirtualUserDb>(m_databasePath, m_root, m_access);
+    for (const auto &[name, record] : m_virtualUsers) {
+        switch (record.state) {
+        case VirtualUserState::Modified:
+            if (!record.previousName.isEmpty()) // a password change keeps the key
+                m_db->del(record.previousName);
+            m_db->put(name, record.password);
+            break;
+        case VirtualUserState::Added:
+            m_db->put(name, record.password);
+            break;
+        case VirtualUserState::Deleted:
+            m_db->del(name);
+            break;
+        case VirtualUserState::Unchanged:
+            break;
+        }
+    }
+    // Closing flushes the pages to the file that pam_userdb reads.
+    m_db->close();
+    m_db->open();
+}
+
+void AccountStore::recreateVirtualUserDb()
+{
+    if (!m_db)
+        m_db = std::make_unique<VirtualUserDb>(m_databasePath, m_root, m_access);
+    m_db->recreate(m_databasePath);
+}
+
+void AccountStore::saveVirtualUsers()
+{
+    try {
+        syncVirtualUsers();
+    } catch (const std::exception &) {
+        std::cerr << "Db env. error. Re-creating database" << std::endl;
+        recreateVirtualUserDb();
+        syncVirtualUsers();
+    }
+}
+
+const std::map<QByteArray, VirtualUserRecord> &AccountStore::virtualUsers() const
+{
+    return m_virtualUsers;
+}
+
+const QByteArray &AccountStore::databasePath() const
+{
+    return m_databasePath;
+}
+
+VirtualUserDb *AccountStore::database() const
+{
+    return m_db.get();
+}
+
+bool sameName(const QString &uiName, const QByteArray &name)
+{
+    return uiName.toUtf8() == name;
+}
+
+bool sameName(const QByteArray &name, const QString &uiName)
+{
+    return sameName(uiName, name);
+}

@@ -1,0 +1,93 @@
+#pragma once
+
+#include "VirtualUserDb.h"
+#include "policy/RootDirectory.h"
+
+#include <QByteArray>
+#include <QList>
+#include <QString>
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <set>
+
+struct AccountRecord
+{
+    QByteArray password;
+    uint32_t uid = 0;
+    uint32_t gid = 0;
+    QByteArray gecos;
+    QByteArray home;
+    QByteArray shell;
+};
+
+struct GroupRecord
+{
+    QByteArray name;
+    uint32_t gid = 0;
+    std::set<QByteArray> members;
+};
+
+// The host's accounts and the virtual FTP users, read once at start-up. On
+// the system root the accounts come from the name service enumeration (so
+// LDAP or NIS accounts count too); on any other root from its etc/passwd.
+class AccountStore
+{
+public:
+    using Access = VirtualUserDb::Access;
+
+    explicit AccountStore(const QByteArray &databasePath, const RootDirectory &root = RootDirectory(),
+                          Access access = Access::ReadWrite);
+    ~AccountStore();
+
+    bool getUserInfo(const QByteArray &name, AccountRecord &record) const;
+    QByteArray shadowPassword(const QByteArray &name) const;
+    // Exactly "!" or "*" in passwd or shadow: a locked hash ("!$6$...") or
+    // "!!" is not bad.
+    bool isBadPassword(const QByteArray &name) const;
+    // Supplementary groups in gid order, then the primary group.
+    QList<QByteArray> userGroups(const QByteArray &name) const;
+    bool isUserInGroup(const QByteArray &name, const QByteArray &groupName) const;
+    int groupIdByName(const QByteArray &groupName) const;
+
+    const std::map<QByteArray, AccountRecord> &accounts() const;
+    const std::map<QByteArray, AccountRecord> &shadow() const;
+    const std::map<uint32_t, GroupRecord> &groups() const;
+
+    // Virtual users: edits stay in memory until syncVirtualUsers().
+    void loadVirtualUsers(const QByteArray &path);
+    bool isVirtualUser(const QByteArray &name) const;
+    void addVirtualUser(const QByteArray &name, const QByteArray &password);
+    void changeVirtualUser(const QByteArray &oldName, const QByteArray &newName, const QByteArray &password);
+    void removeVirtualUser(const QByteArray &name);
+    void syncVirtualUsers();
+    void recreateVirtualUserDb();
+    // What a save does: sync, and when that throws, re-create the database
+    // and sync once more. The re-created file holds only the records added
+    // or changed since loading (the old file is kept beside it). Throws what
+    // the second attempt throws.
+    void saveVirtualUsers();
+
+    const std::map<QByteArray, VirtualUserRecord> &virtualUsers() const;
+    const QByteArray &databasePath() const;
+    VirtualUserDb *database() const;
+
+private:
+    void loadPasswd();
+    void loadShadow();
+    void loadGroups();
+
+    RootDirectory m_root;
+    Access m_access;
+    std::map<QByteArray, AccountRecord> m_passwd;
+    std::map<QByteArray, AccountRecord> m_shadow;
+    std::map<uint32_t, GroupRecord> m_groups;
+    std::map<QByteArray, VirtualUserRecord> m_virtualUsers;
+    QByteArray m_databasePath;
+    std::unique_ptr<VirtualUserDb> m_db;
+};
+
+// Names typed in the user interface against names from the system.
+bool sameName(const QString &uiName, const QByteArray &name);
+bool sameName(const QByteArray &name, const QString &uiName);

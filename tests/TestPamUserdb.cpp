@@ -1,0 +1,127 @@
+// Real PAM reads what the store writes: pam_userdb, driven by pamtester,
+// authenticates the virtual users against the database file we saved. Runs
+// only inside scripts/with-private-etc.sh, which gives it a private /etc.
+#include "Process.h"
+#include "TemporaryRoot.h"
+#include "accounts/AccountStore.h"
+
+#include <QFile>
+#include <QtTest>
+
+namespace {
+
+const QByteArray DbPath = "/var/lib/ftpconfig/vsftpd_virtual_users";
+const QString Service = QStringLiteral("ftpconfig-userdb-test");
+
+bool etcIsPrivate()
+{
+    if (qEnvironmentVariable("FTPCONFIG_PRIVATE_ETC") != QLatin1String("1"))
+        return false;
+    QFile mounts(QStringLiteral("/proc/self/mountinfo"));
+    if (!mounts.open(QIODevice::ReadOnly))
+        return false;
+    for (const QByteArray &line : mounts.readAll().split('\n')) {
+        const QList<QByteArray> fields = line.split(' ');
+        if (fields.size() > 4 && fields[4] == "/etc")
+            return true;
+    }
+    return false;
+}
+
+struct Login
+{
+    QByteArray user;
+    QByteArray password;
+    bool succeeds;
+};
+
+} // namespace
+
+class TestPamUserdb : public QObject
+{
+    Q_OBJECT
+
+private slots:
+    void initTestCase();
+    void pamReadsTheStore();
+
+private:
+    // Checks each login with pamtester: authentication and account stacks.
+    void expectLogins(const QList<Login> &logins, const char *phase);
+};
+
+void TestPamUserdb::initTestCase()
+{
+    QVERIFY2(etcIsPrivate(), "run this test through scripts/with-private-etc.sh: it writes to /etc/pam.d");
+    QVERIFY2(QFile::exists(QStringLiteral("/usr/bin/pamtester")), "pamtester is not installed");
+}
+
+void TestPamUserdb::expectLogins(const QList<Login> &logins, const char *phase)
+{
+    for (const Login &login : logins) {
+        const ProcessResult result = runProcess(
+            QStringLiteral("pamtester"),
+            {Service, QString::fromUtf8(login.user), QStringLiteral("authenticate"), QStringLiteral("acct_mgmt")},
+            login.password + '\n', 20000);
+        QVERIFY2(result.finished, "pamtester did not finish");
+        const QByteArray what
+            = QByteArray(phase) + ": " + login.user + " with \"" + login.password + "\" -> " + result.out + result.err;
+        QVERIFY2((result.exitCode == 0) == login.succeeds, what.constData());
+    }
+}
+
+void TestPamUserdb::pamReadsTheStore()
+{
+    TemporaryRoot root;
+    QVERIFY(root.writeFile("/etc/passwd", "root:x:0:0::/root:/bin/sh\n"));
+    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
+    QVERIFY(root.writeFile("/etc/group", "root:x:0:\n"));
+
+    // pam_userdb appends ".db" itself: the PAM file names the path without it.
+    const QByteArray db = QFile::encodeName(root.filePath(QString::fromUtf8(DbPath)));
+    QFile pam(QStringLiteral("/etc/pam.d/") + Service);
+    QVERIFY(pam.open(QIODevice::WriteOnly | QIODevice::Truncate));
+    pam.write("auth sufficient pam_userdb.so db=" + db
+              + "\n"
+                "account sufficient pam_userdb.so db="
+              + db
+              + "\n"
+                "auth required pam_deny.so\n"
+                "account required pam_deny.so\n");
+    pam.close();
+
+    AccountStore store(DbPath, RootDirectory(root.path()));
+    store.addVirtualUser("anna", "a1");
+    store.addVirtualUser("ben", "b 2");
+    store.addVirtualUser("carl", "c3");
+    store.saveVirtualUsers();
+    expectLogins({{"anna", "a1", true},
+                  {"anna", "a2", false},
+                  {"anna", "", false},
+                  {"ben", "b 2", true},
+                  {"ben", "b", false},
+                  {"carl", "c3", true},
+                  {"dora", "c3", false}},
+                 "first save");
+
+    store.changeVirtualUser("anna", "anne", {});
+    store.saveVirtualUsers();
+    expectLogins({{"anne", "a1", true}, {"anna", "a1", false}}, "after a rename");
+
+    store.changeVirtualUser("ben", "ben", "new secret");
+    store.saveVirtualUsers();
+    expectLogins({{"ben", "new secret", true}, {"ben", "b 2", false}}, "after a password change");
+
+    store.removeVirtualUser("carl");
+    store.saveVirtualUsers();
+    expectLogins({{"carl", "c3", false}, {"anne", "a1", true}, {"ben", "new secret", true}}, "after a delete");
+
+    // A second program run sees the same users.
+    const AccountStore reloaded(DbPath, RootDirectory(root.path()));
+    QCOMPARE(reloaded.virtualUsers().size(), size_t(2));
+    QVERIFY(reloaded.isVirtualUser("anne"));
+    QVERIFY(reloaded.isVirtualUser("ben"));
+}
+
+QTEST_GUILESS_MAIN(TestPamUserdb)
+#include "TestPamUserdb.moc"

@@ -1,0 +1,413 @@
+#include "CaptureStream.h"
+#include "Process.h"
+#include "TemporaryRoot.h"
+#include "accounts/AccountStore.h"
+
+#include <QDir>
+#include <QFileInfo>
+#include <QtTest>
+
+#include <db_cxx.h>
+
+#include <iostream>
+#include <memory>
+#include <sys/stat.h>
+
+namespace {
+
+const QByteArray DbPath = "/var/lib/ftpconfig/vsftpd_virtual_users";
+const QString DbFile = QStringLiteral("/var/lib/ftpconfig/vsftpd_virtual_users.db");
+
+// A root with an empty account set, so that only the database matters.
+void writeAccounts(const TemporaryRoot &root)
+{
+    QVERIFY(root.writeFile("/etc/passwd", "root:x:0:0::/root:/bin/sh\n"));
+    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
+    QVERIFY(root.writeFile("/etc/group", "root:x:0:\n"));
+}
+
+// "name=password/previous/state ..." in name order.
+QString describe(const std::map<QByteArray, VirtualUserRecord> &users)
+{
+    static const char *const states[] = {"Unchanged", "Modified", "Added", "Deleted"};
+    QStringList parts;
+    for (const auto &[name, record] : users) {
+        parts << QStringLiteral("%1=%2/%3/%4")
+                     .arg(QString::fromUtf8(name), QString::fromUtf8(record.password),
+                          QString::fromUtf8(record.previousName), states[static_cast<int>(record.state)]);
+    }
+    return parts.join(QLatin1Char(' '));
+}
+
+// db5.3_dump -p of a file as "name=password ..." in name order.
+QString dumped(const QString &file)
+{
+    const ProcessResult result = runProcess(QStringLiteral("db5.3_dump"), {QStringLiteral("-p"), file});
+    if (result.exitCode != 0)
+        return QStringLiteral("dump failed: ") + QString::fromUtf8(result.err);
+    const QList<QByteArray> lines = result.out.split('\n');
+    QMap<QString, QString> records;
+    bool inData = false;
+    QString key;
+    bool haveKey = false;
+    for (const QByteArray &line : lines) {
+        if (line == "HEADER=END") {
+            inData = true;
+            continue;
+        }
+        if (line == "DATA=END")
+            break;
+        if (!inData) {
+            if (line.startsWith("type=") && line != "type=hash")
+                return QStringLiteral("not a hash: ") + QString::fromUtf8(line);
+            continue;
+        }
+        const QString text = QString::fromUtf8(line.mid(1)); // printable lines start with a blank
+        if (!haveKey) {
+            key = text;
+            haveKey = true;
+        } else {
+            records.insert(key, text);
+            haveKey = false;
+        }
+    }
+    QStringList parts;
+    for (auto it = records.begin(); it != records.end(); ++it)
+        parts << it.key() + QLatin1Char('=') + it.value();
+    return parts.join(QLatin1Char(' '));
+}
+
+bool loadWithDbLoad(const QString &file, const QByteArray &pairs)
+{
+    const ProcessResult result
+        = runProcess(QStringLiteral("db5.3_load"),
+                     {QStringLiteral("-T"), QStringLiteral("-t"), QStringLiteral("hash"), file}, pairs);
+    return result.finished && result.exitCode == 0;
+}
+
+int fileMode(const QString &path)
+{
+    struct stat info
+    {
+    };
+    if (::stat(QFile::encodeName(path).constData(), &info) != 0)
+        return -1;
+    return static_cast<int>(info.st_mode & 07777);
+}
+
+} // namespace
+
+class TestVirtualUserDb : public QObject
+{
+    Q_OBJECT
+
+private slots:
+    void editStates_data();
+    void editStates();
+    void saveAndReload();
+    void readsWhatDbLoadWrote();
+    void filePaths_data();
+    void filePaths();
+    void unusableDirectory();
+    void damaged_data();
+    void damaged();
+    void recreateKeepsOnlyEdits_data();
+    void recreateKeepsOnlyEdits();
+    void readOnlyCreatesNothing();
+};
+
+void TestVirtualUserDb::editStates_data()
+{
+    QTest::addColumn<QStringList>("operations");
+    QTest::addColumn<QString>("result");
+
+    // The database starts with anna=a1 and ben=b1.
+    QTest::newRow("loaded") << QStringList() << "anna=a1//Unchanged ben=b1//Unchanged";
+    QTest::newRow("add") << QStringList{"add carl c1"} << "anna=a1//Unchanged ben=b1//Unchanged carl=c1//Added";
+    QTest::newRow("add existing changes nothing")
+        << QStringList{"add anna other"} << "anna=a1//Unchanged ben=b1//Unchanged";
+    QTest::newRow("remove keeps the entry") << QStringList{"remove ben"} << "anna=a1//Unchanged ben=b1//Deleted";
+    QTest::newRow("remove then add") << QStringList{"remove ben", "add ben b2"} << "anna=a1//Unchanged ben=b2//Added";
+    QTest::newRow("password change") << QStringList{"change anna anna a2"} << "anna=a2//Modified ben=b1//Unchanged";
+    QTest::newRow("same password changes nothing")
+        << QStringList{"change anna anna a1"} << "anna=a1//Unchanged ben=b1//Unchanged";
+    QTest::newRow("empty password never clears")
+        << QStringList{"change anna anna -"} << "anna=a1//Unchanged ben=b1//Unchanged";
+    QTest::newRow("rename") << QStringList{"change anna anne -"} << "anne=a1/anna/Modified ben=b1//Unchanged";
+    QTest::newRow("rename twice keeps the middle name")
+        << QStringList{"change anna anne -", "change anne annie -"} << "annie=a1/anne/Modified ben=b1//Unchanged";
+    QTest::newRow("rename onto an existing user") << QStringList{"change anna ben x9"} << "ben=x9/anna/Modified";
+    QTest::newRow("rename an added user") << QStringList{"add carl c1", "change carl karl -"}
+                                          << "anna=a1//Unchanged ben=b1//Unchanged karl=c1/carl/Modified";
+    QTest::newRow("change an absent user") << QStringList{"change zed zoe z"} << "anna=a1//Unchanged ben=b1//Unchanged";
+}
+
+void TestVirtualUserDb::editStates()
+{
+    QFETCH(QStringList, operations);
+    QFETCH(QString, result);
+
+    TemporaryRoot root;
+    writeAccounts(root);
+    QVERIFY(root.makeDirectory("/var/lib/ftpconfig"));
+    QVERIFY(loadWithDbLoad(root.filePath(DbFile), "anna\na1\nben\nb1\n"));
+
+    AccountStore store(DbPath, RootDirectory(root.path()));
+    for (const QString &operation : qAsConst(operations)) {
+        const QStringList w = operation.split(QLatin1Char(' '));
+        const auto bytes = [&](int i) { return w.at(i) == QLatin1String("-") ? QByteArray() : w.at(i).toUtf8(); };
+        if (w[0] == QLatin1String("add"))
+            store.addVirtualUser(bytes(1), bytes(2));
+        else if (w[0] == QLatin1String("remove"))
+            store.removeVirtualUser(bytes(1));
+        else if (w[0] == QLatin1String("change"))
+            store.changeVirtualUser(bytes(1), bytes(2), bytes(3));
+        else
+            QFAIL("unknown operation");
+    }
+    QCOMPARE(describe(store.virtualUsers()), result);
+    for (const auto &[name, record] : store.virtualUsers())
+        QVERIFY(store.isVirtualUser(name));
+}
+
+void TestVirtualUserDb::saveAndReload()
+{
+    TemporaryRoot root;
+    writeAccounts(root);
+    {
+        AccountStore store(DbPath, RootDirectory(root.path()));
+        QCOMPARE(store.database()->filePath(), QByteArray(DbFile.toUtf8()));
+        QCOMPARE(store.database()->envHome(), QByteArray("/var/lib/ftpconfig"));
+        QVERIFY(store.virtualUsers().empty());
+        store.addVirtualUser("anna", "a1");
+        store.addVirtualUser("ben", "b 1");
+        store.addVirtualUser("carl", "c1");
+        store.syncVirtualUsers();
+        QCOMPARE(fileMode(root.filePath(DbFile)), 0600);
+        QCOMPARE(dumped(root.filePath(DbFile)), QStringLiteral("anna=a1 ben=b 1 carl=c1"));
+
+        store.changeVirtualUser("anna", "anne", "a2");
+        store.changeVirtualUser("ben", "ben", "b2");
+        store.removeVirtualUser("carl");
+        store.addVirtualUser("dora", "d1");
+        store.syncVirtualUsers();
+        // States are kept: a second save repeats the same writes harmlessly.
+        store.syncVirtualUsers();
+        QCOMPARE(dumped(root.filePath(DbFile)), QStringLiteral("anne=a2 ben=b2 dora=d1"));
+        QCOMPARE(fileMode(root.filePath(DbFile)), 0600);
+    }
+    const AccountStore reloaded(DbPath, RootDirectory(root.path()));
+    QCOMPARE(describe(reloaded.virtualUsers()),
+             QStringLiteral("anne=a2//Unchanged ben=b2//Unchanged dora=d1//Unchanged"));
+}
+
+void TestVirtualUserDb::readsWhatDbLoadWrote()
+{
+    TemporaryRoot root;
+    writeAccounts(root);
+    QVERIFY(root.makeDirectory("/srv/db"));
+    QVERIFY(loadWithDbLoad(root.filePath("/srv/db/users.db"), "x\npass word\nyvonne\n\xc3\xa9t\xc3\xa9\n"));
+    const AccountStore store("/srv/db/users.db", RootDirectory(root.path()));
+    QCOMPARE(describe(store.virtualUsers()), QString::fromUtf8("x=pass word//Unchanged yvonne=été//Unchanged"));
+}
+
+void TestVirtualUserDb::filePaths_data()
+{
+    QTest::addColumn<QByteArray>("configured");
+    QTest::addColumn<QByteArray>("filePath");
+    QTest::addColumn<bool>("opens");
+
+    QTest::newRow("without suffix") << QByteArray("/srv/db/users") << QByteArray("/srv/db/users.db") << true;
+    QTest::newRow("with suffix") << QByteArray("/srv/db/users.db") << QByteArray("/srv/db/users.db") << true;
+    QTest::newRow("other suffix") << QByteArray("/srv/db/users.DB") << QByteArray("/srv/db/users.DB.db") << true;
+    QTest::newRow("directory") << QByteArray("/srv/db/") << QByteArray("/srv/db/") << false;
+    QTest::newRow("no slash") << QByteArray("users") << QByteArray("./users.db") << true;
+}
+
+void TestVirtualUserDb::filePaths()
+{
+    QFETCH(QByteArray, configured);
+    QFETCH(QByteArray, filePath);
+    QFETCH(bool, opens);
+
+    TemporaryRoot root;
+    writeAccounts(root);
+    QVERIFY(root.makeDirectory("/work"));
+    const QString previous = QDir::currentPath();
+    QVERIFY(QDir::setCurrent(root.filePath("/work")));
+    CaptureStream err(std::cerr);
+    {
+        VirtualUserDb db(configured, RootDirectory(root.path()));
+        QCOMPARE(db.filePath(), filePath);
+        QCOMPARE(db.isOpen(), opens);
+        if (opens) {
+            const QString onDisk = filePath.startsWith('/') ? root.filePath(QString::fromUtf8(filePath))
+                                                            : root.filePath("/work/" + QString::fromUtf8(filePath));
+            QVERIFY2(QFileInfo::exists(onDisk), qPrintable(onDisk));
+            QCOMPARE(fileMode(onDisk), 0600);
+        } else {
+            QVERIFY(QString::fromStdString(err.text()).startsWith("Error opening database: " + filePath + '\n'));
+            QVERIFY_EXCEPTION_THROWN(db.readAll(), DbException);
+            QVERIFY_EXCEPTION_THROWN(db.put("a", "b"), DbException);
+        }
+    }
+    QVERIFY(QDir::setCurrent(previous));
+}
+
+void TestVirtualUserDb::unusableDirectory()
+{
+    TemporaryRoot root;
+    writeAccounts(root);
+    QVERIFY(root.writeFile("/srv/file", "not a directory"));
+    try {
+        AccountStore store("/srv/file/db/users", RootDirectory(root.path()));
+        QFAIL("no exception");
+    } catch (const std::runtime_error &e) {
+        QCOMPARE(QString::fromLocal8Bit(e.what()),
+                 QStringLiteral("Unable to create path for virtual user database: /srv/file/db/"));
+    }
+}
+
+void TestVirtualUserDb::damaged_data()
+{
+    QTest::addColumn<QString>("damage");
+    QTest::newRow("truncated database") << "truncate";
+    QTest::newRow("garbage database") << "garbage";
+    QTest::newRow("garbage environment") << "environment";
+    QTest::newRow("database is a directory") << "directory";
+}
+
+void TestVirtualUserDb::damaged()
+{
+    QFETCH(QString, damage);
+
+    TemporaryRoot root;
+    writeAccounts(root);
+    QVERIFY(root.makeDirectory("/var/lib/ftpconfig"));
+    QByteArray pairs;
+    for (int i = 0; i < 300; ++i)
+        pairs += "user" + QByteArray::number(i) + "\npassword" + QByteArray::number(i) + "\n";
+    QVERIFY(loadWithDbLoad(root.filePath(DbFile), pairs));
+    const QString file = root.filePath(DbFile);
+    QByteArray oldBytes = root.readFile(DbFile);
+    QVERIFY(oldBytes.size() > 8192);
+
+    if (damage == QLatin1String("truncate")) {
+        QVERIFY(QFile::resize(file, oldBytes.size() / 3));
+        oldBytes.truncate(oldBytes.size() / 3);
+    } else if (damage == QLatin1String("garbage")) {
+        oldBytes = QByteArray(5000, 'G');
+        QVERIFY(root.writeFile(DbFile, oldBytes, 0600));
+    } else if (damage == QLatin1String("environment")) {
+        QVERIFY(root.writeFile("/var/lib/ftpconfig/__db.001", QByteArray(3000, '\x7f')));
+        QVERIFY(root.writeFile("/var/lib/ftpconfig/log.0000000001", QByteArray(3000, 'L')));
+        QVERIFY(root.writeFile("/var/lib/ftpconfig/__db.register", "junk"));
+    } else {
+        QVERIFY(QFile::remove(file));
+        QVERIFY(root.makeDirectory(DbFile));
+    }
+
+    CaptureStream err(std::cerr);
+    AccountStore store({}, RootDirectory(root.path()));
+    bool loaded = true;
+    try {
+        store.loadVirtualUsers(DbPath + ".db");
+    } catch (const std::exception &) {
+        loaded = false;
+    }
+    if (!loaded)
+        QVERIFY2(!err.text().empty(), "a failed load must say why on standard error");
+
+    store.addVirtualUser("fresh", "new-password");
+    if (damage == QLatin1String("directory")) {
+        // Nothing can be written where a directory stands: the save says so.
+        QVERIFY_EXCEPTION_THROWN(store.saveVirtualUsers(), std::exception);
+        QVERIFY(QFileInfo(file).isDir());
+        return;
+    }
+    store.saveVirtualUsers();
+
+    const QString text = QString::fromStdString(err.text());
+    if (damage != QLatin1String("environment") || !loaded) {
+        QVERIFY2(text.contains("Db env. error. Re-creating database\n"), qPrintable(text));
+        QVERIFY2(text.contains("Closing db...\nRemoving db...\n"), qPrintable(text));
+        QVERIFY2(text.contains("Home db: /var/lib/ftpconfig\n"), qPrintable(text));
+        QVERIFY2(text.contains("Iniit db...\n"), qPrintable(text));
+        const QByteArray backup = store.database()->lastBackupPath();
+        QVERIFY2(backup.startsWith(DbPath + ".db.bak-"), backup.constData());
+        QVERIFY(text.contains("Keeping a copy of the old database in " + QString::fromUtf8(backup) + '\n'));
+        QCOMPARE(root.readFile(QString::fromUtf8(backup)), oldBytes);
+        QCOMPARE(fileMode(root.filePath(QString::fromUtf8(backup))), 0600);
+    }
+    QVERIFY(dumped(file).contains(QStringLiteral("fresh=new-password")));
+    QCOMPARE(fileMode(file), 0600);
+}
+
+void TestVirtualUserDb::recreateKeepsOnlyEdits_data()
+{
+    QTest::addColumn<QByteArray>("configured");
+    QTest::addColumn<QString>("afterSave");
+    QTest::addColumn<QString>("copy");
+
+    // Re-creation deletes the file by the path as configured: without the
+    // suffix it deletes nothing and the old records stay.
+    QTest::newRow("configured with .db") << DbPath + ".db"
+                                         << "ben=b2"
+                                         << "anna=a1 ben=b1";
+    QTest::newRow("configured without .db") << DbPath << "anna=a1 ben=b2"
+                                            << "";
+}
+
+void TestVirtualUserDb::recreateKeepsOnlyEdits()
+{
+    QFETCH(QByteArray, configured);
+    QFETCH(QString, afterSave);
+    QFETCH(QString, copy);
+
+    TemporaryRoot root;
+    writeAccounts(root);
+    {
+        AccountStore store(configured, RootDirectory(root.path()));
+        store.addVirtualUser("anna", "a1");
+        store.addVirtualUser("ben", "b1");
+        store.syncVirtualUsers();
+    }
+
+    AccountStore later(configured, RootDirectory(root.path()));
+    later.changeVirtualUser("ben", "ben", "b2");
+    CaptureStream err(std::cerr);
+    later.recreateVirtualUserDb();
+    later.syncVirtualUsers();
+    // Unchanged records are not rewritten; the copy still has them.
+    QCOMPARE(dumped(root.filePath(DbFile)), afterSave);
+    const QByteArray backup = later.database()->lastBackupPath();
+    QCOMPARE(backup.isEmpty(), copy.isEmpty());
+    if (!copy.isEmpty())
+        QCOMPARE(dumped(root.filePath(QString::fromUtf8(backup))), copy);
+    QVERIFY(QString::fromStdString(err.text()).contains(QRegularExpression("\nRemovinglog\\.0+1\n")));
+
+    // What the re-created file holds survives another program run.
+    const AccountStore reloaded(configured, RootDirectory(root.path()));
+    QCOMPARE(reloaded.virtualUsers().at("ben").password, QByteArray("b2"));
+}
+
+void TestVirtualUserDb::readOnlyCreatesNothing()
+{
+    TemporaryRoot root;
+    writeAccounts(root);
+    {
+        const AccountStore store(DbPath, RootDirectory(root.path()), AccountStore::Access::ReadOnly);
+        QVERIFY(store.virtualUsers().empty());
+    }
+    QVERIFY(!root.exists("/var/lib/ftpconfig"));
+    QVERIFY(root.makeDirectory("/var/lib/ftpconfig"));
+    QVERIFY(loadWithDbLoad(root.filePath(DbFile), "anna\na1\n"));
+    const QStringList before = QDir(root.filePath("/var/lib/ftpconfig")).entryList(QDir::AllEntries | QDir::Hidden);
+    AccountStore store(DbPath, RootDirectory(root.path()), AccountStore::Access::ReadOnly);
+    QCOMPARE(describe(store.virtualUsers()), QStringLiteral("anna=a1//Unchanged"));
+    QVERIFY_EXCEPTION_THROWN(store.database()->put("x", "y"), DbException);
+    QCOMPARE(QDir(root.filePath("/var/lib/ftpconfig")).entryList(QDir::AllEntries | QDir::Hidden), before);
+}
+
+QTEST_GUILESS_MAIN(TestVirtualUserDb)
+#include "TestVirtualUserDb.moc"
