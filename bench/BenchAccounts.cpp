@@ -1,0 +1,92 @@
+// Loads 10,000 accounts and 100,000 virtual users from a generated root and
+// compares with the time db5.3_dump needs for the same database file.
+// Usage: benchaccounts [accounts] [virtual-users] [runs]
+#include "accounts/AccountStore.h"
+
+#include <QCoreApplication>
+#include <QDir>
+#include <QElapsedTimer>
+#include <QFile>
+#include <QProcess>
+#include <QTemporaryDir>
+
+#include <algorithm>
+#include <cstdio>
+
+namespace {
+
+bool writeFile(const QString &path, const QByteArray &content)
+{
+    QDir().mkpath(QFileInfo(path).absolutePath());
+    QFile file(path);
+    return file.open(QIODevice::WriteOnly) && file.write(content) == content.size();
+}
+
+double runMs(const QString &program, const QStringList &args, const QByteArray &input = {})
+{
+    QElapsedTimer timer;
+    timer.start();
+    QProcess process;
+    process.start(program, args);
+    process.write(input);
+    process.closeWriteChannel();
+    process.waitForFinished(600000);
+    if (process.exitCode() != 0)
+        std::fprintf(stderr, "%s failed: %s\n", qPrintable(program), process.readAllStandardError().constData());
+    return timer.nsecsElapsed() / 1e6;
+}
+
+} // namespace
+
+int main(int argc, char **argv)
+{
+    QCoreApplication app(argc, argv);
+    const int accounts = argc > 1 ? std::atoi(argv[1]) : 10000;
+    const int virtualUsers = argc > 2 ? std::atoi(argv[2]) : 100000;
+    const int runs = argc > 3 ? std::atoi(argv[3]) : 5;
+
+    QTemporaryDir dir;
+    const QString root = dir.path();
+    QByteArray passwd, shadow, group, pairs;
+    for (int i = 0; i < accounts; ++i) {
+        const QByteArray n = QByteArray::number(i);
+        passwd += "user" + n + ":x:" + QByteArray::number(10000 + i) + ":" + QByteArray::number(10000 + i % 1000)
+            + ":User " + n + ":/home/user" + n + ":/bin/bash\n";
+        shadow += "user" + n + ":" + (i % 10 ? "$6$salt$hash" : "!") + ":19000:0:99999:7:::\n";
+    }
+    for (int g = 0; g < 1000; ++g)
+        group += "group" + QByteArray::number(g) + ":x:" + QByteArray::number(10000 + g) + ":user"
+            + QByteArray::number(g) + ",user" + QByteArray::number(g + 1000) + "\n";
+    for (int i = 0; i < virtualUsers; ++i)
+        pairs += "virtual" + QByteArray::number(i) + "\npassword" + QByteArray::number(i) + "\n";
+    writeFile(root + "/etc/passwd", passwd);
+    writeFile(root + "/etc/shadow", shadow);
+    writeFile(root + "/etc/group", group);
+    QDir().mkpath(root + "/var/lib/ftpconfig");
+    const QString dbFile = root + "/var/lib/ftpconfig/vsftpd_virtual_users.db";
+    const double loadMs = runMs("db5.3_load", {"-T", "-t", "hash", dbFile}, pairs);
+
+    double bestRw = 1e12, bestRo = 1e12, bestDump = 1e12;
+    size_t loaded = 0;
+    for (int run = 0; run < runs; ++run) {
+        QElapsedTimer timer;
+        timer.start();
+        {
+            AccountStore store("/var/lib/ftpconfig/vsftpd_virtual_users", RootDirectory(root));
+            loaded = store.virtualUsers().size() + store.accounts().size();
+            bestRw = std::min(bestRw, timer.nsecsElapsed() / 1e6);
+        }
+        timer.restart();
+        {
+            AccountStore store("/var/lib/ftpconfig/vsftpd_virtual_users", RootDirectory(root),
+                               AccountStore::Access::ReadOnly);
+            bestRo = std::min(bestRo, timer.nsecsElapsed() / 1e6);
+        }
+        bestDump = std::min(bestDump, runMs("db5.3_dump", {"-p", "-f", "/dev/null", dbFile}));
+    }
+    std::printf("accounts %d, virtual users %d, records loaded %zu, db file %lld bytes (db5.3_load %.0f ms)\n",
+                accounts, virtualUsers, loaded, static_cast<long long>(QFileInfo(dbFile).size()), loadMs);
+    std::printf("AccountStore read-write %.1f ms, read-only %.1f ms, db5.3_dump -p %.1f ms (best of %d)\n", bestRw,
+                bestRo, bestDump, runs);
+    return 0;
+}
