@@ -1,0 +1,118 @@
+#include "AccessReport.h"
+
+#include "policy/AppStrings.h"
+#include "policy/FtpServerConfig.h"
+
+#include <QJsonArray>
+#include <QJsonDocument>
+#include <QJsonObject>
+
+#include <algorithm>
+#include <iostream>
+
+void ReportInteraction::show(const Message &message)
+{
+    QString line = message.title.isEmpty() ? message.text : message.title + QStringLiteral(": ") + message.text;
+    if (!message.informativeText.isEmpty())
+        line += QLatin1Char(' ') + message.informativeText;
+    std::cerr << "ftpconfig-report: " << line.replace(QLatin1Char('\n'), QLatin1Char(' ')).toLocal8Bit().constData()
+              << std::endl;
+}
+
+Interaction::Button ReportInteraction::ask(const Question &question)
+{
+    for (const Button refusing : {Button::Cancel, Button::No})
+        if (question.buttons.contains(refusing))
+            return refusing;
+    return question.buttons.isEmpty() ? Button::Cancel : question.buttons.last();
+}
+
+std::optional<QString> ReportInteraction::chooseOwner(const QStringList &)
+{
+    return std::nullopt;
+}
+
+std::optional<QString> ReportInteraction::askPath(const QString &, const QString &)
+{
+    return std::nullopt;
+}
+
+Interaction::PamChoice ReportInteraction::askPamProblem()
+{
+    ++pamProblems;
+    return PamChoice::Skip;
+}
+
+void ReportInteraction::exitProcess(int status)
+{
+    throw ProcessExit{status};
+}
+
+QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interaction)
+{
+    QList<ReportRow> rows;
+    const auto evaluate = [&](const QByteArray &name, const QString &kind) {
+        ReportRow row;
+        row.name = name;
+        row.kind = kind;
+        const int problemsBefore = interaction.pamProblems;
+        row.allowed = config.checkAccess(name, false, &row.failure);
+        if (!row.allowed && row.failure.message.isEmpty() && interaction.pamProblems > problemsBefore) {
+            // The PAM check refuses without a message of its own when the
+            // PAM file does not start its stacks with pam_userdb.so.
+            row.failure.message = QStringLiteral("PAM configuration problem: the first auth or account line of the "
+                                                 "PAM file is not \"sufficient pam_userdb.so\"");
+        }
+        rows.append(row);
+    };
+    for (const auto &entry : config.accounts().accounts())
+        evaluate(entry.first, QStringLiteral("local"));
+    for (const auto &entry : config.accounts().virtualUsers())
+        evaluate(entry.first, QStringLiteral("virtual"));
+    evaluate(AppStrings::instance().anonymousUsers.toLocal8Bit(), QStringLiteral("anonymous"));
+    return rows;
+}
+
+QByteArray reportText(const QList<ReportRow> &rows)
+{
+    const QStringList header{QStringLiteral("USER"), QStringLiteral("KIND"), QStringLiteral("STATUS"),
+                             QStringLiteral("FILE"), QStringLiteral("REASON")};
+    QList<QStringList> table{header};
+    const AppStrings &strings = AppStrings::instance();
+    for (const ReportRow &row : rows) {
+        const bool failed = !row.failure.message.isEmpty();
+        table.append({QString::fromUtf8(row.name), row.kind, row.allowed ? strings.allowed : strings.denied,
+                      failed ? failureKindText(row.failure.kind) : QString(), row.failure.message});
+    }
+    QVector<int> widths(header.size(), 0);
+    for (const QStringList &line : table)
+        for (int i = 0; i < line.size(); ++i)
+            widths[i] = std::max(widths[i], static_cast<int>(line[i].size()));
+    QByteArray out;
+    for (const QStringList &line : table) {
+        QString text;
+        for (int i = 0; i < line.size(); ++i)
+            text += i + 1 < line.size() ? line[i].leftJustified(widths[i] + 2) : line[i];
+        out += text.trimmed().toUtf8() + '\n';
+    }
+    return out;
+}
+
+QByteArray reportJson(const QList<ReportRow> &rows, const QString &root)
+{
+    QJsonArray users;
+    const AppStrings &strings = AppStrings::instance();
+    for (const ReportRow &row : rows) {
+        const bool failed = !row.failure.message.isEmpty();
+        users.append(QJsonObject{
+            {QStringLiteral("name"), QString::fromUtf8(row.name)},
+            {QStringLiteral("kind"), row.kind},
+            {QStringLiteral("status"), row.allowed ? strings.allowed : strings.denied},
+            {QStringLiteral("failureKind"), failed ? static_cast<int>(row.failure.kind) : 0},
+            {QStringLiteral("failureText"), failed ? failureKindText(row.failure.kind) : QString()},
+            {QStringLiteral("message"), row.failure.message},
+        });
+    }
+    const QJsonObject document{{QStringLiteral("root"), root}, {QStringLiteral("users"), users}};
+    return QJsonDocument(document).toJson(QJsonDocument::Indented);
+}

@@ -1,0 +1,41 @@
+#pragma once
+
+#include "policy/AccessFailure.h"
+#include "policy/Interaction.h"
+
+#include <QByteArray>
+#include <QList>
+#include <QString>
+
+class FtpServerConfig;
+
+// One row of the users table as the report prints it.
+struct ReportRow
+{
+    QByteArray name;
+    QString kind; // "local", "virtual" or "anonymous"
+    bool allowed = false;
+    AccessFailure failure;
+};
+
+// Answers every question without asking anybody and without repairing:
+// messages go to standard error, questions get their refusing answer.
+class ReportInteraction : public Interaction
+{
+public:
+    void show(const Message &message) override;
+    Button ask(const Question &question) override;
+    std::optional<QString> chooseOwner(const QStringList &accounts) override;
+    std::optional<QString> askPath(const QString &label, const QString &initial) override;
+    PamChoice askPamProblem() override;
+    [[noreturn]] void exitProcess(int status) override;
+
+    // Counts PAM problem dialogs that were answered with "Skip".
+    int pamProblems = 0;
+};
+
+// Every user of the table, local, virtual, then the anonymous row, with the
+// verdict of checkAccess without repair.
+QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interaction);
+QByteArray reportText(const QList<ReportRow> &rows);
+QByteArray reportJson(const QList<ReportRow> &rows, const QString &root);

@@ -1,0 +1,149 @@
+#pragma once
+
+#include "accounts/AccountStore.h"
+#include "config/ConfigFile.h"
+#include "policy/AccessFailure.h"
+#include "policy/Interaction.h"
+#include "policy/RootDirectory.h"
+
+#include <QByteArray>
+#include <QString>
+#include <QStringList>
+
+#include <map>
+#include <memory>
+#include <optional>
+
+// Everything that decides who may use the FTP server, held in memory: the
+// main configuration, the PAM service file, the lists, the per-user files,
+// the accounts and the virtual users. Checks read it, repairs change it,
+// and only a save writes it back.
+class FtpServerConfig
+{
+public:
+    // ReadOnly creates and changes nothing under the root: a missing main
+    // configuration reads as "listen=YES", no directory, environment or
+    // database file is made.
+    enum class Mode { ReadWrite, ReadOnly };
+    enum class UserlistMode { Off = 0, Allow = 1, Deny = 2 };
+
+    // The arguments of the pam_listfile.so line of the PAM file.
+    struct FtpusersRule
+    {
+        QByteArray item;
+        QByteArray sense;
+        QByteArray file;
+        QByteArray onerr;
+        QByteArray apply;
+    };
+
+    FtpServerConfig(Interaction &interaction, const RootDirectory &root, Mode mode = Mode::ReadWrite);
+    ~FtpServerConfig();
+
+    FtpServerConfig(const FtpServerConfig &) = delete;
+    FtpServerConfig &operator=(const FtpServerConfig &) = delete;
+
+    // Reads every file; a fatal problem ends the process through the
+    // interaction with status -1.
+    void load();
+
+    // May the user log in? With repair, each refusal that a change of the
+    // in-memory files can cure is cured, and the operator is asked where a
+    // directory would change at once. The failure is filled only on refusal.
+    bool checkAccess(const QByteArray &user, bool repair, AccessFailure *failure = nullptr);
+
+    bool checkMainConfig(const QByteArray &user, bool repair, AccessFailure *failure);
+    bool checkReserved(const QByteArray &user, bool repair, AccessFailure *failure);
+    bool checkRootDirectory(const QByteArray &user, bool repair, AccessFailure *failure);
+    bool checkFtpusers(const QByteArray &user, bool repair, AccessFailure *failure);
+    bool checkUserlist(const QByteArray &user, bool repair, AccessFailure *failure);
+    bool checkPassword(const QByteArray &user, bool repair, AccessFailure *failure);
+    bool checkPamUserdb(const QByteArray &user, bool interactive, AccessFailure *failure);
+
+    bool isAnonymousUser(const QByteArray &user) const;
+    bool isVirtualUser(const QByteArray &user) const;
+    UserlistMode userlistMode() const;
+    bool isChrooted(const QByteArray &user) const;
+    // The directory that becomes the user's FTP root, as the administrator
+    // knows it (not resolved under the root directory).
+    QByteArray effectiveRoot(const QByteArray &user) const;
+    // The system account whose rights the user's FTP session has.
+    QByteArray ftpAccountName(const QByteArray &user) const;
+
+    void blockUserByUserlist(const QByteArray &user);
+    // Creates the directory with its parents and gives it to the user's
+    // account. False with a Filesystem failure when it cannot be created.
+    bool createRootDirectory(const QByteArray &user, const QByteArray &directory, AccessFailure *failure = nullptr);
+
+    // Main configuration value of a key, or the default when absent.
+    QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;
+    // Lower-cased value compared with "yes"; absent gives the default.
+    bool isYes(const QByteArray &key, bool absentMeansYes = false) const;
+
+    ConfigFile &mainConfig();
+    ConfigFile &pamConfig();
+    const QByteArray &pamServiceName() const;
+    const std::optional<FtpusersRule> &ftpusersRule() const;
+    ConfigFile &ftpusersList();
+    bool ftpusersModified() const;
+    QStringList &userlist();
+    bool userlistModified() const;
+    QStringList &chrootList();
+    bool chrootListModified() const;
+    const QByteArray &userConfigDir() const;
+    std::map<QByteArray, std::shared_ptr<ConfigFile>> &userConfigs();
+    ConfigFile *userConfig(const QByteArray &user) const;
+    // The pam_userdb database as the store opens it (".db" appended).
+    const QByteArray &virtualUsersDbPath() const;
+    AccountStore &accounts();
+    const AccountStore &accounts() const;
+    const RootDirectory &root() const;
+    Interaction &interaction();
+    Mode mode() const;
+
+    // Set by every repair and edit of the in-memory files.
+    bool isModified() const;
+    void setModified(bool modified);
+
+    // The module path the PAM fix writes, fixed when the program is built.
+    static QByteArray pamUserdbModule();
+
+private:
+    void loadMainConfig();
+    void loadPamConfig();
+    void loadUserlist();
+    void loadFtpusers();
+    void loadChrootList();
+    void loadUserConfigs();
+    void loadVirtualUsers();
+    QStringList readNameList(const QByteArray &path) const;
+    QString resolved(const QByteArray &path) const;
+    bool ensureDirectoryOf(const QString &path);
+    bool fixPamUserdb();
+    void setYes(const QByteArray &key);
+
+    Interaction &m_interaction;
+    RootDirectory m_root;
+    Mode m_mode;
+
+    ConfigFile m_main{SyntaxMode::KeyValue};
+    ConfigFile m_pam{SyntaxMode::TokenLine};
+    QByteArray m_pamServiceName;
+    std::optional<FtpusersRule> m_ftpusersRule;
+    ConfigFile m_ftpusers{SyntaxMode::KeyValue};
+    bool m_ftpusersModified = false;
+    QByteArray m_userlistPath;
+    QStringList m_userlist;
+    bool m_userlistModified = false;
+    QByteArray m_chrootListPath;
+    QStringList m_chrootList;
+    bool m_chrootListModified = false;
+    QByteArray m_userConfigDir;
+    std::map<QByteArray, std::shared_ptr<ConfigFile>> m_userConfigs;
+    QByteArray m_dbPath;
+    std::unique_ptr<AccountStore> m_accounts;
+    bool m_modified = false;
+};
+
+// The critical box that explains a refusal.
+void showFailureDialog(Interaction &interaction, const AccessFailure &failure);
