@@ -155,7 +155,7 @@ QStringList FtpServerConfig::readNameList(const QByteArray &path) const
 void FtpServerConfig::loadUserlist()
 {
     m_userlistPath = value("userlist_file", DefaultListDirectory + "allowed_user_list.conf");
-    m_userlist = readNameList(m_userlistPath);
+    m_userlist = NameList(readNameList(m_userlistPath));
 }
 
 void FtpServerConfig::loadFtpusers()
@@ -178,7 +178,7 @@ void FtpServerConfig::loadFtpusers()
 void FtpServerConfig::loadChrootList()
 {
     m_chrootListPath = value("chroot_list_file", "/etc/vsftpd.chroot_list");
-    m_chrootList = readNameList(m_chrootListPath);
+    m_chrootList = NameList(readNameList(m_chrootListPath));
 }
 
 void FtpServerConfig::loadUserConfigs()
@@ -465,7 +465,7 @@ bool FtpServerConfig::checkFtpusers(const QByteArray &user, bool repair, AccessF
         const QList<QByteArray> groups = m_accounts ? m_accounts->userGroups(user) : QList<QByteArray>();
         bool listed = false;
         for (const QByteArray &group : groups)
-            listed = listed || containsToken(m_ftpusers.elements, str(group));
+            listed = listed || ftpusersListed(group);
         if (allow) {
             if (listed)
                 return true;
@@ -480,6 +480,7 @@ bool FtpServerConfig::checkFtpusers(const QByteArray &user, bool repair, AccessF
             } else {
                 insertTokenLine(m_ftpusers.elements, {str(groups.first())}, InsertAt::End);
                 m_ftpusersModified = m_modified = true;
+                m_ftpusersIndexValid = false;
             }
             return true;
         }
@@ -494,12 +495,13 @@ bool FtpServerConfig::checkFtpusers(const QByteArray &user, bool repair, AccessF
         for (const QByteArray &group : groups)
             removeTokenEverywhere(m_ftpusers.elements, str(group));
         m_ftpusersModified = m_modified = true;
+        m_ftpusersIndexValid = false;
         return true;
     }
     if (rule.item != "user" && rule.item != "ruser")
         return true;
 
-    const bool listed = containsToken(m_ftpusers.elements, str(user));
+    const bool listed = ftpusersListed(user);
     if (!allow) {
         if (!listed)
             return true;
@@ -509,6 +511,7 @@ bool FtpServerConfig::checkFtpusers(const QByteArray &user, bool repair, AccessF
         }
         removeTokenEverywhere(m_ftpusers.elements, str(user));
         m_ftpusersModified = m_modified = true;
+        m_ftpusersIndexValid = false;
         return true;
     }
     if (listed)
@@ -519,6 +522,7 @@ bool FtpServerConfig::checkFtpusers(const QByteArray &user, bool repair, AccessF
     }
     insertTokenLine(m_ftpusers.elements, {str(user)}, InsertAt::End);
     m_ftpusersModified = m_modified = true;
+    m_ftpusersIndexValid = false;
     return true;
 }
 
@@ -590,7 +594,10 @@ bool FtpServerConfig::ensureDirectoryOf(const QString &path)
 
 bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, AccessFailure *failure)
 {
-    if (QSettings().value(QStringLiteral("skip_pam_check"), false).toBool())
+    // Read once: the table asks for every virtual user.
+    if (!m_skipPamCheck)
+        m_skipPamCheck = QSettings().value(QStringLiteral("skip_pam_check"), false).toBool();
+    if (*m_skipPamCheck)
         return true;
     if (!isVirtualUser(user))
         return true;
@@ -623,6 +630,7 @@ bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, A
                 return false;
             if (choice == Interaction::PamChoice::Valid) {
                 QSettings().setValue(QStringLiteral("skip_pam_check"), true);
+                m_skipPamCheck = true;
                 return true;
             }
             return fixPamUserdb();
@@ -783,7 +791,23 @@ const std::optional<FtpServerConfig::FtpusersRule> &FtpServerConfig::ftpusersRul
 
 ConfigFile &FtpServerConfig::ftpusersList()
 {
+    m_ftpusersIndexValid = false; // the caller may change it
     return m_ftpusers;
+}
+
+bool FtpServerConfig::ftpusersListed(const QByteArray &name)
+{
+    if (!m_ftpusersIndexValid) {
+        m_ftpusersIndex.clear();
+        for (const auto &element : m_ftpusers.elements) {
+            if (element->type() != ElementType::Expr)
+                continue;
+            for (const auto &token : std::static_pointer_cast<ConfigElementExpr>(element)->tokens)
+                m_ftpusersIndex.insert(QByteArray::fromStdString(token.text));
+        }
+        m_ftpusersIndexValid = true;
+    }
+    return m_ftpusersIndex.contains(name);
 }
 
 bool FtpServerConfig::ftpusersModified() const
@@ -791,9 +815,14 @@ bool FtpServerConfig::ftpusersModified() const
     return m_ftpusersModified;
 }
 
-QStringList &FtpServerConfig::userlist()
+NameList &FtpServerConfig::userlist()
 {
     return m_userlist;
+}
+
+const QByteArray &FtpServerConfig::userlistPath() const
+{
+    return m_userlistPath;
 }
 
 bool FtpServerConfig::userlistModified() const
@@ -801,9 +830,14 @@ bool FtpServerConfig::userlistModified() const
     return m_userlistModified;
 }
 
-QStringList &FtpServerConfig::chrootList()
+NameList &FtpServerConfig::chrootList()
 {
     return m_chrootList;
+}
+
+const QByteArray &FtpServerConfig::chrootListPath() const
+{
+    return m_chrootListPath;
 }
 
 bool FtpServerConfig::chrootListModified() const

@@ -4,9 +4,11 @@
 #include "config/ConfigFile.h"
 #include "policy/AccessFailure.h"
 #include "policy/Interaction.h"
+#include "policy/NameList.h"
 #include "policy/RootDirectory.h"
 
 #include <QByteArray>
+#include <QSet>
 #include <QString>
 #include <QStringList>
 
@@ -86,9 +88,11 @@ public:
     const std::optional<FtpusersRule> &ftpusersRule() const;
     ConfigFile &ftpusersList();
     bool ftpusersModified() const;
-    QStringList &userlist();
+    NameList &userlist();
+    const QByteArray &userlistPath() const;
     bool userlistModified() const;
-    QStringList &chrootList();
+    NameList &chrootList();
+    const QByteArray &chrootListPath() const;
     bool chrootListModified() const;
     const QByteArray &userConfigDir() const;
     std::map<QByteArray, std::shared_ptr<ConfigFile>> &userConfigs();
@@ -117,6 +121,7 @@ private:
     void loadUserConfigs();
     void loadVirtualUsers();
     QStringList readNameList(const QByteArray &path) const;
+    bool ftpusersListed(const QByteArray &name);
     QString resolved(const QByteArray &path) const;
     bool ensureDirectoryOf(const QString &path);
     bool fixPamUserdb();
@@ -132,11 +137,15 @@ private:
     std::optional<FtpusersRule> m_ftpusersRule;
     ConfigFile m_ftpusers{SyntaxMode::KeyValue};
     bool m_ftpusersModified = false;
+    // Names of the ftpusers list; rebuilt after any change of the document.
+    QSet<QByteArray> m_ftpusersIndex;
+    bool m_ftpusersIndexValid = false;
+    std::optional<bool> m_skipPamCheck;
     QByteArray m_userlistPath;
-    QStringList m_userlist;
+    NameList m_userlist;
     bool m_userlistModified = false;
     QByteArray m_chrootListPath;
-    QStringList m_chrootList;
+    NameList m_chrootList;
     bool m_chrootListModified = false;
     QByteArray m_userConfigDir;
     std::map<QByteArray, std::shared_ptr<ConfigFile>> m_userConfigs;
