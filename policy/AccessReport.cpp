@@ -57,6 +57,8 @@ QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interac
         row.kind = kind;
         const int problemsBefore = interaction.pamProblems;
         row.allowed = config.checkAccess(name, false, &row.failure);
+        row.directory = config.effectiveRoot(name);
+        row.rights = rightsText(config.userRights(name));
         if (!row.allowed && row.failure.message.isEmpty() && interaction.pamProblems > problemsBefore) {
             // The PAM check refuses without a message of its own when the
             // PAM file does not start its stacks with pam_userdb.so.
@@ -75,13 +77,15 @@ QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interac
 
 QByteArray reportText(const QList<ReportRow> &rows)
 {
-    const QStringList header{QStringLiteral("USER"), QStringLiteral("KIND"), QStringLiteral("STATUS"),
-                             QStringLiteral("FILE"), QStringLiteral("REASON")};
+    const QStringList header{QStringLiteral("USER"),      QStringLiteral("KIND"),   QStringLiteral("STATUS"),
+                             QStringLiteral("DIRECTORY"), QStringLiteral("RIGHTS"), QStringLiteral("FILE"),
+                             QStringLiteral("REASON")};
     QList<QStringList> table{header};
     const AppStrings &strings = AppStrings::instance();
     for (const ReportRow &row : rows) {
         const bool failed = !row.failure.message.isEmpty();
         table.append({QString::fromUtf8(row.name), row.kind, row.allowed ? strings.allowed : strings.denied,
+                      QString::fromUtf8(row.directory), row.rights.isEmpty() ? QStringLiteral("-") : row.rights,
                       failed ? failureKindText(row.failure.kind) : QString(), row.failure.message});
     }
     QVector<int> widths(header.size(), 0);
@@ -108,6 +112,8 @@ QByteArray reportJson(const QList<ReportRow> &rows, const QString &root)
             {QStringLiteral("name"), QString::fromUtf8(row.name)},
             {QStringLiteral("kind"), row.kind},
             {QStringLiteral("status"), row.allowed ? strings.allowed : strings.denied},
+            {QStringLiteral("directory"), QString::fromUtf8(row.directory)},
+            {QStringLiteral("rights"), row.rights},
             {QStringLiteral("failureKind"), failed ? static_cast<int>(row.failure.kind) : 0},
             {QStringLiteral("failureText"), failed ? failureKindText(row.failure.kind) : QString()},
             {QStringLiteral("message"), row.failure.message},

@@ -16,6 +16,8 @@ struct ReportRow
     QString kind; // "local", "virtual" or "anonymous"
     bool allowed = false;
     AccessFailure failure;
+    QByteArray directory; // the effective FTP root
+    QString rights; // as the table's mode column shows them
 };
 
 // Answers every question without asking anybody and without repairing:

@@ -121,6 +121,7 @@ void FtpServerConfig::loadMainConfig()
         m_interaction.exitProcess(-1);
     }
     m_main.parse(in);
+    remember(path, m_main);
 }
 
 void FtpServerConfig::loadPamConfig()
@@ -135,6 +136,7 @@ void FtpServerConfig::loadPamConfig()
     }
     std::ifstream in(QFile::encodeName(file).toStdString(), std::ios::in | std::ios::binary);
     m_pam.parse(in);
+    remember(path, m_pam);
 }
 
 QStringList FtpServerConfig::readNameList(const QByteArray &path) const
@@ -171,8 +173,10 @@ void FtpServerConfig::loadFtpusers()
     rule.apply = QByteArray::fromStdString(tokenArgument(*line, "apply"));
     m_ftpusersRule = rule;
     std::ifstream in(QFile::encodeName(resolved(rule.file)).toStdString(), std::ios::in | std::ios::binary);
-    if (in.is_open())
+    if (in.is_open()) {
         m_ftpusers.parse(in);
+        remember(text(rule.file), m_ftpusers);
+    }
 }
 
 void FtpServerConfig::loadChrootList()
@@ -203,6 +207,7 @@ void FtpServerConfig::loadUserConfigs()
         auto document = std::make_shared<ConfigFile>(SyntaxMode::KeyValue);
         document->parse(in);
         m_userConfigs.emplace(QFile::encodeName(name), document);
+        remember(text(m_userConfigDir) + name, *document);
     }
 }
 

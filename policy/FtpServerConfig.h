@@ -77,6 +77,33 @@ public:
     // account. False with a Filesystem failure when it cannot be created.
     bool createRootDirectory(const QByteArray &user, const QByteArray &directory, AccessFailure *failure = nullptr);
 
+    // Rights ------------------------------------------------------------
+    // The rights list of the table's mode column, from the keys of the
+    // user's per-user file (the main configuration for the anonymous user)
+    // over those of the main configuration and the server's defaults; all
+    // four rights show as "full access". Untranslated words.
+    QStringList userRights(const QByteArray &user) const;
+    // Writes the keys of the rights, given as their display string
+    // ("write, download"), into the user's per-user file (created when
+    // missing) or, for the anonymous user, into the main configuration.
+    bool setUserRights(const QByteArray &user, const QString &rights);
+    // Creates the user's per-user file on disk with its first comment line
+    // and registers it. Refuses names that cannot be file names.
+    bool createUserConfig(const QByteArray &user);
+    // anon_root for the anonymous user, local_root in the per-user file for
+    // everybody else.
+    bool setUserRoot(const QByteArray &user, const QByteArray &directory);
+    // Confines a local user to its root through the chroot keys and list.
+    void setChrooted(const QByteArray &user);
+    // Compares the rights with the permission bits of the user's root and
+    // offers to fix the bits; changes the directory at once.
+    void checkFolderPermissions(const QByteArray &user, const QStringList &rights);
+
+    // Writes back everything loaded and changed, store by store; a failure
+    // is reported and the next store is written all the same. True when
+    // nothing failed. Files whose content did not change are not touched.
+    bool save();
+
     // Main configuration value of a key, or the default when absent.
     QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;
     // Lower-cased value compared with "yes"; absent gives the default.
@@ -125,6 +152,11 @@ private:
     QString resolved(const QByteArray &path) const;
     bool ensureDirectoryOf(const QString &path);
     bool fixPamUserdb();
+    void remember(const QString &key, const ConfigFile &document);
+    bool unchanged(const QString &key, const std::string &text) const;
+    bool saveNameList(const QByteArray &path, const NameList &names, bool modified);
+    void saveUserConfigs();
+    ConfigFile *rightsTarget(const QByteArray &user);
     void setYes(const QByteArray &key);
 
     Interaction &m_interaction;
@@ -152,7 +184,15 @@ private:
     QByteArray m_dbPath;
     std::unique_ptr<AccountStore> m_accounts;
     bool m_modified = false;
+    // How each document printed when it was loaded: a save leaves a file
+    // that would print the same untouched, byte for byte.
+    std::map<QString, std::string> m_loadedText;
 };
+
+// The translated rights words of a list, in the fixed display order.
+QString rightsText(const QStringList &rights);
+// "rwxr-x---" of the owner, group and other permission bits.
+QString permissionLetters(unsigned flags);
 
 // The critical box that explains a refusal.
 void showFailureDialog(Interaction &interaction, const AccessFailure &failure);

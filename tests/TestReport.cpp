@@ -127,7 +127,9 @@ void TestReport::badRoots()
 void TestReport::table()
 {
     FixtureRoot root;
-    QVERIFY(root.write({{"/etc/vsftpd.d/allowed_user_list.conf", "alice\n"}}));
+    QVERIFY(root.write({{"/etc/vsftpd.d/allowed_user_list.conf", "alice\n"},
+                        {"/etc/vsftpd.conf", "local_enable=YES\nwrite_enable=YES\nchroot_list_enable=YES\n"},
+                        {"/etc/vsftpd.chroot_list", "bob\n"}}));
     const ProcessResult result = report({QStringLiteral("--root"), root.path()});
     QCOMPARE(result.exitCode, 0);
     const QList<QByteArray> lines = result.out.split('\n');
@@ -139,14 +141,14 @@ void TestReport::table()
         }
         return QByteArray();
     };
-    QCOMPARE(line("bob"), QByteArray("bob local allowed"));
+    QCOMPARE(line("bob"), QByteArray("bob local allowed /home/bob write, download, mkdir"));
     QCOMPARE(line("alice"),
-             QByteArray("alice local denied FTP userlist file ***Result: FALSE. Check: userlist file "
-                        "contains alice, userlist file mode = black users"));
+             QByteArray("alice local denied / write, download, mkdir FTP userlist file ***Result: FALSE. Check: "
+                        "userlist file contains alice, userlist file mode = black users"));
     QCOMPARE(line("root"),
-             QByteArray("root local denied PAM ftpusers file ***Result: FALSE. Check: ftpusers file "
-                        "(item:user|ruser, sense:deny) contains root record."));
-    QCOMPARE(line("Anonymous users"), QByteArray("Anonymous users anonymous allowed"));
+             QByteArray("root local denied / write, download, mkdir PAM ftpusers file ***Result: FALSE. Check: "
+                        "ftpusers file (item:user|ruser, sense:deny) contains root record."));
+    QCOMPARE(line("Anonymous users"), QByteArray("Anonymous users anonymous allowed /srv/ftp download"));
     // One line per account, the anonymous row, the header and the final newline.
     QCOMPARE(lines.size(), 8 + 1 + 1 + 1);
 }

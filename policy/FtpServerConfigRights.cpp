@@ -1,0 +1,276 @@
+// Rights, per-user files, roots and folder permissions of FtpServerConfig.
+#include "FtpServerConfig.h"
+
+#include "policy/AppStrings.h"
+#include "policy/SafeFile.h"
+
+#include <QCoreApplication>
+#include <QDir>
+#include <QFile>
+#include <QFileInfo>
+
+#include <iostream>
+#include <sys/stat.h>
+
+namespace {
+
+QString tr(const char *text)
+{
+    return QCoreApplication::translate("FtpServerConfig", text);
+}
+
+QString text(const QByteArray &bytes)
+{
+    return QString::fromUtf8(bytes);
+}
+
+const char CreatedComment[] = "# File was created by FTP manager\n";
+
+// The rights words in display order, untranslated and translated.
+struct Right
+{
+    const char *word;
+    QString AppStrings::*translated;
+};
+const Right Rights[] = {
+    {"full access", &AppStrings::fullAccess}, {"write", &AppStrings::write}, {"download", &AppStrings::download},
+    {"upload", &AppStrings::upload},          {"mkdir", &AppStrings::mkdir},
+};
+
+} // namespace
+
+QString rightsText(const QStringList &rights)
+{
+    const AppStrings &strings = AppStrings::instance();
+    QStringList shown;
+    for (const Right &right : Rights) {
+        if (rights.contains(QLatin1String(right.word)))
+            shown << strings.*right.translated;
+    }
+    return shown.join(QStringLiteral(", "));
+}
+
+QString permissionLetters(unsigned flags)
+{
+    static const char letters[] = "rwx";
+    QString out;
+    for (int shift = 6; shift >= 0; shift -= 3) {
+        for (int bit = 0; bit < 3; ++bit)
+            out += (flags >> (shift + 2 - bit)) & 1 ? QLatin1Char(letters[bit]) : QLatin1Char('-');
+    }
+    return out;
+}
+
+ConfigFile *FtpServerConfig::rightsTarget(const QByteArray &user)
+{
+    return isAnonymousUser(user) ? &m_main : userConfig(user);
+}
+
+QStringList FtpServerConfig::userRights(const QByteArray &user) const
+{
+    const ConfigFile *own = isAnonymousUser(user) ? nullptr : userConfig(user);
+    // A per-user file overrides the main configuration, which overrides the
+    // server's defaults.
+    const auto yes = [&](const char *key, bool serverDefault) {
+        if (own) {
+            if (const auto data = findData(own->elements, "", key))
+                return QByteArray::fromStdString(data->value).toLower() == "yes";
+        }
+        return isYes(key, serverDefault);
+    };
+    const bool anonymousWrites = isAnonymousUser(user) || isYes("guest_enable");
+    const bool writeEnabled = yes("write_enable", false);
+    const bool write = writeEnabled && (!anonymousWrites || yes("anon_other_write_enable", false));
+    const bool download = yes("download_enable", true);
+    const bool upload = writeEnabled && yes("anon_upload_enable", false);
+    const bool mkdir = writeEnabled && (!anonymousWrites || yes("anon_mkdir_write_enable", false));
+    if (write && download && upload && mkdir)
+        return {QStringLiteral("full access")};
+    QStringList rights;
+    if (write)
+        rights << QStringLiteral("write");
+    if (download)
+        rights << QStringLiteral("download");
+    if (upload)
+        rights << QStringLiteral("upload");
+    if (mkdir)
+        rights << QStringLiteral("mkdir");
+    return rights;
+}
+
+bool FtpServerConfig::createUserConfig(const QByteArray &user)
+{
+    const QByteArray path = m_userConfigDir + user;
+    if (const auto reason = invalidNameReason(user)) {
+        std::cerr << "Unable to open " << path.constData() << std::endl;
+        m_interaction.critical(QString(),
+                               tr("Unable to create per-user config file.") + QLatin1Char('\n')
+                                   + tr("\"%1\" cannot be a file name: %2.").arg(text(user), *reason));
+        std::cout << "File " << path.constData() << " is not created." << std::endl;
+        return false;
+    }
+    const QString file = resolved(path);
+    QDir().mkpath(QFileInfo(file).absolutePath());
+    const QString error = writeFileAtomically(file, CreatedComment);
+    if (!error.isEmpty()) {
+        std::cerr << "Unable to open " << path.constData() << std::endl;
+        m_interaction.critical(QString(), tr("Unable to create per-user config file."));
+        std::cout << "File " << path.constData() << " is not created." << std::endl;
+        return false;
+    }
+    auto document = std::make_shared<ConfigFile>(SyntaxMode::KeyValue);
+    document->parseText(CreatedComment);
+    m_userConfigs[user] = document;
+    // On disk already: a save writes it again only once it is changed.
+    remember(text(path), *document);
+    return true;
+}
+
+bool FtpServerConfig::setUserRights(const QByteArray &user, const QString &rights)
+{
+    const AppStrings &strings = AppStrings::instance();
+    const QStringList parts = rights.split(QStringLiteral(", "));
+    const auto has = [&](const QString &word) { return parts.contains(word); };
+    const bool full = has(strings.fullAccess);
+
+    if (!isAnonymousUser(user) && !userConfig(user) && !createUserConfig(user)) {
+        std::cout << "Unable to create userconf file" << std::endl;
+        return false;
+    }
+    ConfigFile *target = rightsTarget(user);
+    std::cout << "Set permissions: " << rights.toLocal8Bit().constData() << " for user " << user.constData()
+              << std::endl;
+    const bool anonymousKeys = isYes("guest_enable") || isAnonymousUser(user);
+    const auto set = [&](const char *key, bool value) { setValue(target->elements, "", key, value ? "yes" : "no"); };
+
+    if (full || has(strings.write)) {
+        set("write_enable", true);
+        if (anonymousKeys)
+            set("anon_other_write_enable", true);
+    } else {
+        set("write_enable", false);
+        // The anonymous write keys mean nothing to a local user's session.
+        if (anonymousKeys)
+            set("anon_other_write_enable", false);
+    }
+    set("download_enable", full || has(strings.download));
+    set("anon_upload_enable", full || has(strings.upload));
+    if (full || has(strings.mkdir)) {
+        if (anonymousKeys)
+            set("anon_mkdir_write_enable", true);
+        // Deliberately after the write row: "mkdir" alone turns writing on.
+        set("write_enable", true);
+    } else if (anonymousKeys) {
+        set("anon_mkdir_write_enable", false);
+    }
+    m_modified = true;
+    return true;
+}
+
+bool FtpServerConfig::setUserRoot(const QByteArray &user, const QByteArray &directory)
+{
+    if (isAnonymousUser(user)) {
+        setValue(m_main.elements, "", "anon_root", directory.toStdString());
+    } else {
+        if (!userConfig(user) && !createUserConfig(user))
+            return false;
+        setValue(userConfig(user)->elements, "", "local_root", directory.toStdString());
+    }
+    m_modified = true;
+    return true;
+}
+
+void FtpServerConfig::setChrooted(const QByteArray &user)
+{
+    AccountRecord record;
+    if (isYes("guest_enable") || !m_accounts || !m_accounts->getUserInfo(user, record) || isChrooted(user))
+        return;
+    const QString name = text(user);
+    const bool local = isYes("chroot_local_user");
+    if (isYes("chroot_list_enable")) {
+        if (local)
+            m_chrootList.removeAll(name);
+        else
+            m_chrootList.append(name);
+    } else {
+        // Neither confines the user yet: the list, enabled, does.
+        setValue(m_main.elements, "", "chroot_list_enable", "yes");
+        m_chrootList.append(name);
+    }
+    m_chrootListModified = m_modified = true;
+}
+
+void FtpServerConfig::checkFolderPermissions(const QByteArray &user, const QStringList &rights)
+{
+    const AppStrings &strings = AppStrings::instance();
+    const QByteArray directory = effectiveRoot(user);
+    const QString shown = text(directory);
+    const QByteArray onDisk = QFile::encodeName(resolved(directory));
+    struct stat info
+    {
+    };
+    if (::stat(onDisk.constData(), &info) != 0)
+        return;
+
+    const QByteArray account = ftpAccountName(user);
+    AccountRecord record;
+    if (!m_accounts || !m_accounts->getUserInfo(account, record)) {
+        m_interaction.critical(
+            QString(), tr("Unable to get groups in which user participates in. Username: %1").arg(text(account)));
+        return;
+    }
+    QByteArray ownerName;
+    for (const auto &entry : m_accounts->accounts()) {
+        if (entry.second.uid == info.st_uid) {
+            ownerName = entry.first;
+            break;
+        }
+    }
+    QByteArray groupName;
+    const auto group = m_accounts->groups().find(info.st_gid);
+    if (group != m_accounts->groups().end())
+        groupName = group->second.name;
+    if (ownerName.isEmpty())
+        ownerName = QByteArray::number(info.st_uid);
+    if (groupName.isEmpty())
+        groupName = QByteArray::number(info.st_gid);
+
+    // The permission class the session's account falls in.
+    int shift = 0;
+    if (info.st_uid == record.uid)
+        shift = 6;
+    else if (m_accounts->isUserInGroup(account, groupName))
+        shift = 3;
+    const mode_t readBit = S_IROTH << shift;
+    const mode_t writeBit = S_IWOTH << shift;
+
+    const bool full = rights.contains(strings.fullAccess) || rights.contains(QStringLiteral("full access"));
+    const auto has = [&](const QString &translated, const char *word) {
+        return full || rights.contains(translated) || rights.contains(QLatin1String(word));
+    };
+    const QString mapped
+        = account != user ? tr("Detected mapped system user: %1").arg(text(account)) + QLatin1Char('\n') : QString();
+    mode_t mode = info.st_mode & 07777;
+    const auto askFix = [&](const QString &question, mode_t bit) {
+        Interaction::Question box;
+        box.message = {Interaction::Icon::Question, QString(), question.arg(text(account)), tr("Let me fix it?"),
+                       mapped + tr("Folder owner: %1\nFolder group: %2\n").arg(text(ownerName), text(groupName))
+                           + QLatin1Char('\n') + tr("Current permissions:\n") + permissionLetters(mode)
+                           + QLatin1Char('\n') + tr("New permissions:\n") + permissionLetters(mode | bit)};
+        box.buttons = {Interaction::Button::Yes, Interaction::Button::No};
+        if (m_interaction.ask(box) == Interaction::Button::Yes)
+            mode |= bit;
+    };
+
+    if (has(strings.download, "download") && !(mode & readBit))
+        askFix(tr("User may download, but folder has no READ permission for user %1"), readBit);
+    const bool writes = has(strings.write, "write") || has(strings.upload, "upload") || has(strings.mkdir, "mkdir");
+    if (writes && !(mode & writeBit)) {
+        if (isAnonymousUser(user))
+            m_interaction.warn(QString(), tr("Root folder for anonymous user must be read-only by him."));
+        else if (!isYes("guest_enable"))
+            askFix(tr("User may write, but folder has no WRITE permission for user %1"), writeBit);
+    }
+    if (mode != (info.st_mode & 07777) && ::chmod(onDisk.constData(), mode) != 0)
+        m_interaction.critical(QString(), tr("Unable to change permissions of folder %1").arg(shown));
+}

@@ -1,0 +1,187 @@
+// Saving of FtpServerConfig: every store written back through one writer.
+#include "FtpServerConfig.h"
+
+#include "policy/AppStrings.h"
+#include "policy/SafeFile.h"
+
+#include <QCoreApplication>
+#include <QDir>
+#include <QFile>
+#include <QFileInfo>
+
+#include <iostream>
+
+namespace {
+
+QString tr(const char *text)
+{
+    return QCoreApplication::translate("FtpServerConfig", text);
+}
+
+QString text(const QByteArray &bytes)
+{
+    return QString::fromUtf8(bytes);
+}
+
+QString directoryOf(const QString &path)
+{
+    const int slash = path.lastIndexOf(QLatin1Char('/'));
+    return slash <= 0 ? QStringLiteral("/") : path.left(slash);
+}
+
+} // namespace
+
+void FtpServerConfig::remember(const QString &key, const ConfigFile &document)
+{
+    m_loadedText[key] = document.text();
+}
+
+bool FtpServerConfig::unchanged(const QString &key, const std::string &printed) const
+{
+    const auto it = m_loadedText.find(key);
+    return it != m_loadedText.end() && it->second == printed;
+}
+
+bool FtpServerConfig::saveNameList(const QByteArray &path, const NameList &names, bool modified)
+{
+    const QString shown = text(path);
+    const QString file = resolved(path);
+    // An unchanged list stays as the administrator wrote it; a missing one
+    // is created, since an enabled list without its file stops the server.
+    if (!modified && QFileInfo(file).isFile())
+        return true;
+    const QString directory = directoryOf(file);
+    if (!QDir().mkpath(directory)) {
+        m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(directoryOf(shown)));
+    }
+    QByteArray content;
+    for (const QString &name : names.names()) {
+        const QByteArray bytes = name.toUtf8();
+        if (bytes.contains('\n') || bytes.contains('\r') || bytes.isEmpty()) {
+            std::cerr << "Skipping a name with a line break in " << path.constData() << std::endl;
+            continue;
+        }
+        content += bytes + '\n';
+    }
+    if (!writeFileAtomically(file, content).isEmpty()) {
+        m_interaction.critical(QString(), tr("Unable to save %1").arg(shown));
+        return false;
+    }
+    return true;
+}
+
+void FtpServerConfig::saveUserConfigs()
+{
+    const QString directory = resolved(m_userConfigDir);
+    if (!QDir().mkpath(directory)) {
+        m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(text(m_userConfigDir)));
+        std::cerr << "Unable to create userconf dir: " << m_userConfigDir.constData() << std::endl;
+    }
+    for (const auto &[user, document] : m_userConfigs) {
+        const QString shown = text(m_userConfigDir + user);
+        const std::string printed = document->text();
+        if (unchanged(shown, printed))
+            continue;
+        if (const auto reason = invalidNameReason(user)) {
+            m_interaction.critical(QString(),
+                                   tr("Unable to save %1").arg(shown) + QLatin1Char('\n')
+                                       + tr("\"%1\" cannot be a file name: %2.").arg(text(user), *reason));
+            continue;
+        }
+        // Printed followed by a line end, as the program always wrote them.
+        if (!writeFileAtomically(resolved(m_userConfigDir + user), QByteArray::fromStdString(printed) + '\n')
+                 .isEmpty()) {
+            m_interaction.critical(QString(), tr("Unable to save %1").arg(shown));
+            continue;
+        }
+        m_loadedText[shown] = printed + '\n';
+        // The file now ends with an empty line the document does not hold:
+        // read it back so that the next save compares like with like.
+        document->parseText(m_loadedText[shown]);
+    }
+}
+
+bool FtpServerConfig::save()
+{
+    if (m_mode == Mode::ReadOnly)
+        return false;
+    bool ok = true;
+
+    // 1. Virtual users.
+    try {
+        if (m_accounts)
+            m_accounts->saveVirtualUsers();
+    } catch (const std::exception &e) {
+        m_interaction.critical(QString(),
+                               tr("Unable to save virtual users. Message: ") + QString::fromLocal8Bit(e.what()));
+        ok = false;
+    } catch (...) {
+        m_interaction.critical(QString(), tr("Unable to save virtual users. Unknown error."));
+        ok = false;
+    }
+
+    // 2. Userlist, always enabled afterwards.
+    m_userlistPath = value("userlist_file", "/etc/vsftpd.d/allowed_user_list.conf");
+    ok = saveNameList(m_userlistPath, m_userlist, m_userlistModified) && ok;
+    setValue(m_main.elements, "", "userlist_enable", "yes");
+    m_userlistModified = false;
+
+    // 3. Chroot list.
+    m_chrootListPath = value("chroot_list_file", "/etc/vsftpd.chroot_list");
+    ok = saveNameList(m_chrootListPath, m_chrootList, m_chrootListModified) && ok;
+    m_chrootListModified = false;
+
+    // 4. Per-user files.
+    saveUserConfigs();
+
+    // 5. PAM file.
+    const QString pamPath = AppStrings::instance().pamDirectory + text(value("pam_service_name", "vsftpd"));
+    if (!QFileInfo(resolved(QFile::encodeName(pamPath))).isFile()) {
+        m_interaction.critical(tr("Save PAM file"),
+                               tr("Unable to find vsftpd PAM config file (default is in /etc/pam.d/vsftpd).\nIt is "
+                                  "neccesary for virtual users mechanism. Create it and re-run ftp config"));
+        ok = false;
+    } else if (!unchanged(pamPath, m_pam.text())) {
+        if (!writeFileAtomically(resolved(QFile::encodeName(pamPath)), QByteArray::fromStdString(m_pam.text()))
+                 .isEmpty()) {
+            std::cout << "File " << QFile::encodeName(pamPath).constData() << " could not be created or opened"
+                      << std::endl;
+            ok = false;
+        } else {
+            remember(pamPath, m_pam);
+        }
+    }
+
+    // 6. The pam_listfile list. A missing one is not created: its absence
+    // is what the rule's onerr= decides on.
+    if (m_ftpusersRule) {
+        const QString listPath = text(m_ftpusersRule->file);
+        if (!QFileInfo(resolved(m_ftpusersRule->file)).isFile()) {
+            std::cout << "File " << m_ftpusersRule->file.constData() << " not found" << std::endl;
+        } else if (!unchanged(listPath, m_ftpusers.text())) {
+            if (!writeFileAtomically(resolved(m_ftpusersRule->file), QByteArray::fromStdString(m_ftpusers.text()))
+                     .isEmpty()) {
+                std::cout << "Ftpusers file (" << m_ftpusersRule->file.constData() << ") could not be open"
+                          << std::endl;
+                ok = false;
+            } else {
+                remember(listPath, m_ftpusers);
+            }
+        }
+        m_ftpusersModified = false;
+    }
+
+    // 7. Main configuration.
+    const QString mainPath = AppStrings::instance().mainConfigPath;
+    if (!unchanged(mainPath, m_main.text())) {
+        if (!writeFileAtomically(m_root.resolve(mainPath), QByteArray::fromStdString(m_main.text())).isEmpty()) {
+            m_interaction.critical(QString(), tr("Unable to save %1").arg(mainPath));
+            ok = false;
+        } else {
+            remember(mainPath, m_main);
+        }
+    }
+    if (ok)
+        m_modified = false;
+    return ok;
+}

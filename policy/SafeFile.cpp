@@ -1,0 +1,114 @@
+#include "SafeFile.h"
+
+#include <QCoreApplication>
+#include <QFile>
+#include <QFileInfo>
+
+#include <cerrno>
+#include <cstring>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace {
+
+QString systemError(const char *what, int error)
+{
+    return QStringLiteral("%1: %2").arg(QLatin1String(what), QString::fromLocal8Bit(std::strerror(error)));
+}
+
+bool writeAll(int fd, const QByteArray &content)
+{
+    const char *data = content.constData();
+    qsizetype left = content.size();
+    while (left > 0) {
+        const ssize_t written = ::write(fd, data, static_cast<size_t>(left));
+        if (written < 0) {
+            if (errno == EINTR)
+                continue;
+            return false;
+        }
+        data += written;
+        left -= written;
+    }
+    return true;
+}
+
+} // namespace
+
+QString writeFileAtomically(const QString &path, const QByteArray &content, mode_t newFileMode)
+{
+    const QByteArray target = QFile::encodeName(path);
+    const QFileInfo info(path);
+    const QByteArray directory = QFile::encodeName(info.absolutePath());
+
+    mode_t mode = newFileMode;
+    std::optional<std::pair<uid_t, gid_t>> owner;
+    struct stat existing
+    {
+    };
+    if (::lstat(target.constData(), &existing) == 0) {
+        if (S_ISDIR(existing.st_mode))
+            return systemError("the target is a directory", EISDIR);
+        // A symlink is replaced by a file of the default mode: writing
+        // through it could reach any file of the system.
+        if (S_ISREG(existing.st_mode)) {
+            mode = existing.st_mode & 07777;
+            owner = std::make_pair(existing.st_uid, existing.st_gid);
+        }
+    }
+
+    QByteArray temporary = directory + "/." + QFile::encodeName(info.fileName()) + ".ftpconfig-XXXXXX";
+    const int fd = ::mkstemp(temporary.data());
+    if (fd < 0)
+        return systemError("cannot create a temporary file", errno);
+    const auto fail = [&](const char *what) {
+        const int error = errno;
+        ::close(fd);
+        ::unlink(temporary.constData());
+        return systemError(what, error);
+    };
+    if (!writeAll(fd, content))
+        return fail("cannot write");
+    if (::fchmod(fd, mode) != 0)
+        return fail("cannot set the mode");
+    if (owner && ::fchown(fd, owner->first, owner->second) != 0)
+        return fail("cannot set the owner");
+    if (::fsync(fd) != 0)
+        return fail("cannot sync");
+    if (::close(fd) != 0) {
+        const int error = errno;
+        ::unlink(temporary.constData());
+        return systemError("cannot close", error);
+    }
+    if (::rename(temporary.constData(), target.constData()) != 0) {
+        const int error = errno;
+        ::unlink(temporary.constData());
+        return systemError("cannot rename", error);
+    }
+    // The rename itself reaches the disk with the directory.
+    const int dirFd = ::open(directory.constData(), O_RDONLY | O_DIRECTORY);
+    if (dirFd >= 0) {
+        ::fsync(dirFd);
+        ::close(dirFd);
+    }
+    return QString();
+}
+
+std::optional<QString> invalidNameReason(const QByteArray &name)
+{
+    const auto tr = [](const char *text) { return QCoreApplication::translate("SafeFile", text); };
+    if (name.isEmpty())
+        return tr("the name is empty");
+    if (name.contains('/'))
+        return tr("the name contains \"/\"");
+    if (name.startsWith('.'))
+        return tr("the name begins with \".\"");
+    if (name.contains('\n'))
+        return tr("the name contains a line break");
+    for (const char c : name) {
+        if (static_cast<unsigned char>(c) < 0x20 || c == 0x7f)
+            return tr("the name contains a control character");
+    }
+    return std::nullopt;
+}
