@@ -78,11 +78,14 @@ QStringList FtpServerConfig::userRights(const QByteArray &user) const
         }
         return isYes(key, serverDefault);
     };
+    // The inverse of setUserRights, so that what the table shows is what
+    // it writes back (whether the server lets a session use a right is the
+    // forecast's business).
     const bool anonymousWrites = isAnonymousUser(user) || isYes("guest_enable");
     const bool writeEnabled = yes("write_enable", false);
     const bool write = writeEnabled && (!anonymousWrites || yes("anon_other_write_enable", false));
     const bool download = yes("download_enable", true);
-    const bool upload = writeEnabled && yes("anon_upload_enable", false);
+    const bool upload = yes("anon_upload_enable", false);
     const bool mkdir = writeEnabled && (!anonymousWrites || yes("anon_mkdir_write_enable", false));
     if (write && download && upload && mkdir)
         return {QStringLiteral("full access")};
