@@ -1,6 +1,7 @@
 #include "FtpServerConfig.h"
 
 #include "policy/AppStrings.h"
+#include "policy/SafeFile.h"
 
 #include <QCoreApplication>
 #include <QDir>
@@ -158,6 +159,7 @@ void FtpServerConfig::loadUserlist()
 {
     m_userlistPath = value("userlist_file", DefaultListDirectory + "allowed_user_list.conf");
     m_userlist = NameList(readNameList(m_userlistPath));
+    m_loadedText[text(m_userlistPath)] = nameListContent(m_userlist, m_userlistPath).toStdString();
 }
 
 void FtpServerConfig::loadFtpusers()
@@ -183,6 +185,7 @@ void FtpServerConfig::loadChrootList()
 {
     m_chrootListPath = value("chroot_list_file", "/etc/vsftpd.chroot_list");
     m_chrootList = NameList(readNameList(m_chrootListPath));
+    m_loadedText[text(m_chrootListPath)] = nameListContent(m_chrootList, m_chrootListPath).toStdString();
 }
 
 void FtpServerConfig::loadUserConfigs()
@@ -198,6 +201,10 @@ void FtpServerConfig::loadUserConfigs()
     }
     const QStringList names = QDir(directory).entryList(QDir::Files | QDir::Hidden, QDir::Name);
     for (const QString &name : names) {
+        // Hidden files are editor backups or what an interrupted save left;
+        // vsftpd looks a file up by the user's name, which is never such.
+        if (invalidNameReason(QFile::encodeName(name)))
+            continue;
         const QString file = QDir(directory).filePath(name);
         std::ifstream in(QFile::encodeName(file).toStdString(), std::ios::in | std::ios::binary);
         if (!in.is_open()) {

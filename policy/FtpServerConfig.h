@@ -154,8 +154,9 @@ private:
     bool fixPamUserdb();
     void remember(const QString &key, const ConfigFile &document);
     bool unchanged(const QString &key, const std::string &text) const;
-    bool saveNameList(const QByteArray &path, const NameList &names, bool modified);
-    void saveUserConfigs();
+    QByteArray nameListContent(const NameList &names, const QByteArray &path) const;
+    bool saveNameList(const QByteArray &path, const NameList &names);
+    bool saveUserConfigs();
     ConfigFile *rightsTarget(const QByteArray &user);
     void setYes(const QByteArray &key);
 

@@ -42,18 +42,8 @@ bool FtpServerConfig::unchanged(const QString &key, const std::string &printed) 
     return it != m_loadedText.end() && it->second == printed;
 }
 
-bool FtpServerConfig::saveNameList(const QByteArray &path, const NameList &names, bool modified)
+QByteArray FtpServerConfig::nameListContent(const NameList &names, const QByteArray &path) const
 {
-    const QString shown = text(path);
-    const QString file = resolved(path);
-    // An unchanged list stays as the administrator wrote it; a missing one
-    // is created, since an enabled list without its file stops the server.
-    if (!modified && QFileInfo(file).isFile())
-        return true;
-    const QString directory = directoryOf(file);
-    if (!QDir().mkpath(directory)) {
-        m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(directoryOf(shown)));
-    }
     QByteArray content;
     for (const QString &name : names.names()) {
         const QByteArray bytes = name.toUtf8();
@@ -63,19 +53,39 @@ bool FtpServerConfig::saveNameList(const QByteArray &path, const NameList &names
         }
         content += bytes + '\n';
     }
+    return content;
+}
+
+bool FtpServerConfig::saveNameList(const QByteArray &path, const NameList &names)
+{
+    const QString shown = text(path);
+    const QString file = resolved(path);
+    const QByteArray content = nameListContent(names, path);
+    // A list whose names did not change stays as the administrator wrote
+    // it; a missing one is created, since an enabled list without its file
+    // stops the server.
+    if (QFileInfo(file).isFile() && unchanged(shown, content.toStdString()))
+        return true;
+    const QString directory = directoryOf(file);
+    if (!QDir().mkpath(directory)) {
+        m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(directoryOf(shown)));
+    }
     if (!writeFileAtomically(file, content).isEmpty()) {
         m_interaction.critical(QString(), tr("Unable to save %1").arg(shown));
         return false;
     }
+    m_loadedText[shown] = content.toStdString();
     return true;
 }
 
-void FtpServerConfig::saveUserConfigs()
+bool FtpServerConfig::saveUserConfigs()
 {
+    bool ok = true;
     const QString directory = resolved(m_userConfigDir);
     if (!QDir().mkpath(directory)) {
         m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(text(m_userConfigDir)));
         std::cerr << "Unable to create userconf dir: " << m_userConfigDir.constData() << std::endl;
+        ok = false;
     }
     for (const auto &[user, document] : m_userConfigs) {
         const QString shown = text(m_userConfigDir + user);
@@ -92,6 +102,7 @@ void FtpServerConfig::saveUserConfigs()
         if (!writeFileAtomically(resolved(m_userConfigDir + user), QByteArray::fromStdString(printed) + '\n')
                  .isEmpty()) {
             m_interaction.critical(QString(), tr("Unable to save %1").arg(shown));
+            ok = false;
             continue;
         }
         m_loadedText[shown] = printed + '\n';
@@ -99,6 +110,7 @@ void FtpServerConfig::saveUserConfigs()
         // read it back so that the next save compares like with like.
         document->parseText(m_loadedText[shown]);
     }
+    return ok;
 }
 
 bool FtpServerConfig::save()
@@ -122,17 +134,17 @@ bool FtpServerConfig::save()
 
     // 2. Userlist, always enabled afterwards.
     m_userlistPath = value("userlist_file", "/etc/vsftpd.d/allowed_user_list.conf");
-    ok = saveNameList(m_userlistPath, m_userlist, m_userlistModified) && ok;
+    ok = saveNameList(m_userlistPath, m_userlist) && ok;
     setValue(m_main.elements, "", "userlist_enable", "yes");
     m_userlistModified = false;
 
     // 3. Chroot list.
     m_chrootListPath = value("chroot_list_file", "/etc/vsftpd.chroot_list");
-    ok = saveNameList(m_chrootListPath, m_chrootList, m_chrootListModified) && ok;
+    ok = saveNameList(m_chrootListPath, m_chrootList) && ok;
     m_chrootListModified = false;
 
     // 4. Per-user files.
-    saveUserConfigs();
+    ok = saveUserConfigs() && ok;
 
     // 5. PAM file.
     const QString pamPath = AppStrings::instance().pamDirectory + text(value("pam_service_name", "vsftpd"));

@@ -1,0 +1,316 @@
+#include "CaptureStream.h"
+#include "FixtureRoot.h"
+#include "ScriptedInteraction.h"
+#include "policy/FtpServerConfig.h"
+#include "policy/SafeFile.h"
+
+#include <QDirIterator>
+#include <QStandardPaths>
+#include <QtTest>
+
+#include <iostream>
+#include <memory>
+#include <sys/stat.h>
+#include <unistd.h>
+
+using FileMap = QMap<QString, QByteArray>;
+Q_DECLARE_METATYPE(FileMap)
+
+namespace {
+
+// Files an administrator may well have, with layout the model normalises
+// when it prints: a save must leave them alone unless they changed.
+FileMap richFiles()
+{
+    return {
+        {"/etc/vsftpd.conf",
+         "# Example config\nlisten=YES\n      local_enable=YES\nanon_root = /srv/ftp  \n"
+         "userlist_file=/etc/vsftpd.d/allowed_user_list.conf\nchroot_list_enable=YES\n\n\n"},
+        {"/etc/vsftpd.d/allowed_user_list.conf", "  carl  \n\nalice\n"},
+        {"/etc/vsftpd.chroot_list", "bob \n"},
+        {"/etc/ftpusers", "# deny\n      root\n"},
+        {"/etc/vsftpd.d/users.d/bob", "# bob\n        local_root=/srv/bob\nwrite_enable=YES"},
+        {"/etc/vsftpd.d/users.d/alice", "download_enable=NO\n"},
+    };
+}
+
+struct Engine
+{
+    FixtureRoot root;
+    ScriptedInteraction interaction;
+    std::unique_ptr<FtpServerConfig> config;
+
+    bool load(const FileMap &files)
+    {
+        return root.write(files) && reload();
+    }
+
+    bool reload()
+    {
+        config = std::make_unique<FtpServerConfig>(interaction, RootDirectory(root.path()));
+        CaptureStream out(std::cout);
+        config->load();
+        return true;
+    }
+};
+
+// Every regular file below the root except the database environment.
+QMap<QString, QByteArray> snapshot(const FixtureRoot &root)
+{
+    QMap<QString, QByteArray> files;
+    QDirIterator it(root.path(), QDir::Files | QDir::Hidden | QDir::System, QDirIterator::Subdirectories);
+    while (it.hasNext()) {
+        const QString path = it.next().mid(root.path().size());
+        if (path.startsWith(QLatin1String("/var/lib/ftpconfig/")))
+            continue;
+        files.insert(path, root.readFile(path));
+    }
+    return files;
+}
+
+QStringList differences(const QMap<QString, QByteArray> &before, const QMap<QString, QByteArray> &after)
+{
+    QStringList changed;
+    QSet<QString> all;
+    for (auto it = before.begin(); it != before.end(); ++it)
+        all.insert(it.key());
+    for (auto it = after.begin(); it != after.end(); ++it)
+        all.insert(it.key());
+    for (const QString &path : all) {
+        if (before.value(path, "<absent>") != after.value(path, "<absent>"))
+            changed << path;
+    }
+    changed.sort();
+    return changed;
+}
+
+struct stat statOf(const QString &path)
+{
+    struct stat info
+    {
+    };
+    ::lstat(QFile::encodeName(path).constData(), &info);
+    return info;
+}
+
+} // namespace
+
+class TestSave : public QObject
+{
+    Q_OBJECT
+
+private slots:
+    void initTestCase();
+    void unchangedSave();
+    void changeSaveReload();
+    void perUserFilesEndWithAnEmptyLine();
+    void failures_data();
+    void failures();
+    void writerKeepsModeAndOwner();
+    void writerReplacesSymlinks();
+    void writerRefusesDirectories();
+    void hiddenFilesAreNoUsers();
+};
+
+void TestSave::initTestCase()
+{
+    QStandardPaths::setTestModeEnabled(true);
+}
+
+void TestSave::unchangedSave()
+{
+    Engine engine;
+    QVERIFY(engine.load(richFiles()));
+    const auto before = snapshot(engine.root);
+    QVERIFY(engine.config->save());
+    const auto after = snapshot(engine.root);
+    // Only what a save changes on purpose: the userlist is always enabled,
+    // before the trailing empty lines; a file that is written has its
+    // indentation printed as tabs of four columns and spaces.
+    QCOMPARE(differences(before, after), QStringList{"/etc/vsftpd.conf"});
+    QCOMPARE(after["/etc/vsftpd.conf"],
+             QByteArray("# Example config\nlisten=YES\n\t  local_enable=YES\nanon_root = "
+                        "/srv/ftp  \nuserlist_file=/etc/vsftpd.d/allowed_user_list.conf\n"
+                        "chroot_list_enable=YES\nuserlist_enable=yes\n\n\n"));
+    QCOMPARE(engine.interaction.records.size(), 0);
+
+    // Saving again changes nothing at all.
+    QVERIFY(engine.config->save());
+    QCOMPARE(differences(after, snapshot(engine.root)), QStringList());
+}
+
+void TestSave::changeSaveReload()
+{
+    Engine engine;
+    FileMap files = richFiles();
+    files.insert("/etc/pam.d/vsftpd",
+                 "auth sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
+                 "account sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
+                 "auth required pam_listfile.so item=user sense=deny file=/etc/ftpusers\n");
+    QVERIFY(engine.load(files));
+    const auto before = snapshot(engine.root);
+    FtpServerConfig &config = *engine.config;
+    CaptureStream out(std::cout);
+    QVERIFY(config.setUserRights("alice", "write, download"));
+    QVERIFY(config.checkFtpusers("root", true, nullptr));
+    config.blockUserByUserlist("bob");
+    config.setChrooted("alice");
+    config.accounts().addVirtualUser("vera", "pw");
+    QVERIFY(config.save());
+    QCOMPARE(engine.interaction.records.size(), 0);
+
+    QCOMPARE(
+        differences(before, snapshot(engine.root)),
+        (QStringList{"/etc/ftpusers", "/etc/vsftpd.chroot_list", "/etc/vsftpd.conf",
+                     "/etc/vsftpd.d/allowed_user_list.conf", "/etc/vsftpd.d/users.d/alice", "/etc/vsftpd/virtual.db"}));
+    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/allowed_user_list.conf"), QByteArray("carl\nalice\nbob\n"));
+    QCOMPARE(engine.root.readFile("/etc/vsftpd.chroot_list"), QByteArray("bob\nalice\n"));
+    QCOMPARE(engine.root.readFile("/etc/ftpusers"), QByteArray("# deny\n"));
+    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/users.d/alice"),
+             QByteArray("download_enable=yes\nwrite_enable=yes\nanon_upload_enable=no\n\n"));
+
+    const auto saved = snapshot(engine.root);
+    QVERIFY(engine.reload());
+    FtpServerConfig &again = *engine.config;
+    QVERIFY(again.checkAccess("root", false) == false); // still a "*" in shadow, but no longer listed
+    QVERIFY(!again.checkAccess("bob", false));
+    AccessFailure failure;
+    QVERIFY(!again.checkAccess("alice", false, &failure)); // listed in the black userlist
+    QCOMPARE(failure.kind, FailureKind::UserlistFile);
+    QVERIFY(again.isVirtualUser("vera"));
+    QCOMPARE(::rightsText(again.userRights("alice")), QStringLiteral("write, download, mkdir"));
+    QVERIFY(again.save());
+    QCOMPARE(differences(saved, snapshot(engine.root)), QStringList());
+}
+
+void TestSave::perUserFilesEndWithAnEmptyLine()
+{
+    Engine engine;
+    QVERIFY(engine.load(richFiles()));
+    CaptureStream out(std::cout);
+    QVERIFY(engine.config->setUserRoot("bob", "/srv/elsewhere"));
+    QVERIFY(engine.config->save());
+    // Printed, then a line end of its own: the program has always written
+    // them so; indentation is normalised to tabs.
+    const QByteArray first = "# bob\n\t\tlocal_root=/srv/elsewhere\nwrite_enable=YES\n\n";
+    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/users.d/bob"), first);
+    QVERIFY(engine.config->setUserRoot("bob", "/srv/third"));
+    QVERIFY(engine.config->save());
+    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/users.d/bob"),
+             QByteArray("# bob\n\t\tlocal_root=/srv/third\nwrite_enable=YES\n\n\n"));
+}
+
+void TestSave::failures_data()
+{
+    QTest::addColumn<QString>("damage");
+    QTest::addColumn<QStringList>("texts");
+    QTest::addColumn<QString>("written"); // a file that must still be saved
+
+    QTest::newRow("PAM file gone") << "pam"
+                                   << QStringList{"Save PAM file|Unable to find vsftpd PAM config file (default is in "
+                                                  "/etc/pam.d/vsftpd).\nIt is neccesary for virtual users mechanism. "
+                                                  "Create it and re-run ftp config"}
+                                   << "/etc/vsftpd.d/allowed_user_list.conf";
+    QTest::newRow("userlist directory impossible")
+        << "userlist"
+        << QStringList{"|Unable to create path /etc/blocked/sub. Server may not start.",
+                       "|Unable to save /etc/blocked/sub/list"}
+        << "/etc/vsftpd.chroot_list";
+    QTest::newRow("per-user directory impossible")
+        << "userdir"
+        << QStringList{"|Unable to create path /etc/vsftpd.d/users.d/. Server may not start.",
+                       "|Unable to save /etc/vsftpd.d/users.d/bob"}
+        << "/etc/vsftpd.conf";
+}
+
+void TestSave::failures()
+{
+    QFETCH(QString, damage);
+    QFETCH(QStringList, texts);
+    QFETCH(QString, written);
+
+    Engine engine;
+    QVERIFY(engine.load(richFiles()));
+    CaptureStream out(std::cout);
+    CaptureStream err(std::cerr);
+    engine.config->userlist().append("dora");
+    engine.config->setChrooted("alice");
+    QVERIFY(engine.config->setUserRoot("bob", "/srv/elsewhere"));
+    if (damage == QLatin1String("pam")) {
+        QVERIFY(QFile::remove(engine.root.filePath("/etc/pam.d/vsftpd")));
+    } else if (damage == QLatin1String("userlist")) {
+        QVERIFY(engine.root.writeFile("/etc/blocked", "a file where a directory should be"));
+        setValue(engine.config->mainConfig().elements, "", "userlist_file", "/etc/blocked/sub/list");
+        engine.config->userlist().append("erin");
+    } else {
+        QDir(engine.root.filePath("/etc/vsftpd.d/users.d")).removeRecursively();
+        QVERIFY(engine.root.writeFile("/etc/vsftpd.d/users.d", "a file"));
+    }
+    QVERIFY(!engine.config->save());
+    QCOMPARE(engine.interaction.texts(), texts);
+    QVERIFY2(engine.root.exists(written), qPrintable(written));
+    // Whatever failed, the main configuration is written last all the same.
+    QVERIFY(engine.root.readFile("/etc/vsftpd.conf").contains("userlist_enable=yes\n"));
+    if (damage == QLatin1String("userdir"))
+        QVERIFY(QString::fromStdString(err.text()).contains("Unable to create userconf dir: /etc/vsftpd.d/users.d/\n"));
+}
+
+void TestSave::writerKeepsModeAndOwner()
+{
+    FixtureRoot root;
+    QVERIFY(root.writeFile("/etc/private.conf", "old\n", 0640));
+    const QString path = root.filePath("/etc/private.conf");
+    QCOMPARE(::chown(QFile::encodeName(path).constData(), 1000, 1001), 0);
+    QCOMPARE(writeFileAtomically(path, "new\n"), QString());
+    const struct stat info = statOf(path);
+    QCOMPARE(info.st_mode & 07777, 0640u);
+    QCOMPARE(info.st_uid, 1000u);
+    QCOMPARE(info.st_gid, 1001u);
+    QCOMPARE(root.readFile("/etc/private.conf"), QByteArray("new\n"));
+    // No temporary file is left behind.
+    QCOMPARE(QDir(root.filePath("/etc")).entryList(QDir::Files | QDir::Hidden), QStringList{"private.conf"});
+    // A new file gets the mode asked for.
+    QCOMPARE(writeFileAtomically(root.filePath("/etc/fresh"), "x", 0600), QString());
+    QCOMPARE(statOf(root.filePath("/etc/fresh")).st_mode & 07777, 0600u);
+}
+
+void TestSave::writerReplacesSymlinks()
+{
+    Engine engine;
+    QVERIFY(engine.load(richFiles()));
+    // Someone plants a link where the userlist goes, pointing at a file
+    // that must never be written.
+    QVERIFY(engine.root.writeFile("/etc/shadow-copy", "precious\n", 0600));
+    const QString list = engine.root.filePath("/etc/vsftpd.d/allowed_user_list.conf");
+    QVERIFY(QFile::remove(list));
+    QVERIFY(QFile::link(engine.root.filePath("/etc/shadow-copy"), list));
+    engine.config->userlist().append("dora");
+    QVERIFY(engine.config->save());
+    QCOMPARE(engine.root.readFile("/etc/shadow-copy"), QByteArray("precious\n"));
+    QVERIFY(S_ISREG(statOf(list).st_mode));
+    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/allowed_user_list.conf"), QByteArray("carl\nalice\ndora\n"));
+}
+
+void TestSave::writerRefusesDirectories()
+{
+    FixtureRoot root;
+    QVERIFY(root.makeDirectory("/etc/dir"));
+    QVERIFY(writeFileAtomically(root.filePath("/etc/dir"), "x").startsWith("the target is a directory"));
+    QVERIFY(writeFileAtomically(root.filePath("/missing/dir/file"), "x").startsWith("cannot create a temporary file"));
+}
+
+void TestSave::hiddenFilesAreNoUsers()
+{
+    // Leftovers of an interrupted save, or an editor's backup, are no users.
+    Engine engine;
+    FileMap files = richFiles();
+    files.insert("/etc/vsftpd.d/users.d/.bob.ftpconfig-Ab12Cd", "write_enable=YES\n");
+    QVERIFY(engine.load(files));
+    QStringList users;
+    for (const auto &entry : engine.config->userConfigs())
+        users << QString::fromUtf8(entry.first);
+    QCOMPARE(users, (QStringList{"alice", "bob"}));
+}
+
+QTEST_GUILESS_MAIN(TestSave)
+#include "TestSave.moc"
