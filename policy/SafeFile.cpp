@@ -1,6 +1,7 @@
 #include "SafeFile.h"
 
 #include <QCoreApplication>
+#include <QDir>
 #include <QFile>
 #include <QFileInfo>
 
@@ -85,6 +86,13 @@ QString writeFileAtomically(const QString &path, const QByteArray &content, mode
         const int error = errno;
         ::unlink(temporary.constData());
         return systemError("cannot rename", error);
+    }
+    // Temporary files of this target that an interrupted write left behind.
+    const QDir dir(info.absolutePath());
+    const QString prefix = QLatin1Char('.') + info.fileName() + QLatin1String(".ftpconfig-");
+    for (const QString &stale : dir.entryList({prefix + QLatin1Char('*')}, QDir::Files | QDir::Hidden | QDir::System)) {
+        if (stale.size() == prefix.size() + 6)
+            QFile::remove(dir.filePath(stale));
     }
     // The rename itself reaches the disk with the directory.
     const int dirFd = ::open(directory.constData(), O_RDONLY | O_DIRECTORY);

@@ -267,8 +267,12 @@ void TestSave::writerKeepsModeAndOwner()
     QCOMPARE(info.st_uid, 1000u);
     QCOMPARE(info.st_gid, 1001u);
     QCOMPARE(root.readFile("/etc/private.conf"), QByteArray("new\n"));
-    // No temporary file is left behind.
-    QCOMPARE(QDir(root.filePath("/etc")).entryList(QDir::Files | QDir::Hidden), QStringList{"private.conf"});
+    // No temporary file is left behind, nor one an interrupted write left.
+    QVERIFY(root.writeFile("/etc/.private.conf.ftpconfig-a1B2c3", "torn"));
+    QVERIFY(root.writeFile("/etc/.other.ftpconfig-a1B2c3", "not ours to remove"));
+    QCOMPARE(writeFileAtomically(path, "newer\n"), QString());
+    QCOMPARE(QDir(root.filePath("/etc")).entryList(QDir::Files | QDir::Hidden),
+             (QStringList{".other.ftpconfig-a1B2c3", "private.conf"}));
     // A new file gets the mode asked for.
     QCOMPARE(writeFileAtomically(root.filePath("/etc/fresh"), "x", 0600), QString());
     QCOMPARE(statOf(root.filePath("/etc/fresh")).st_mode & 07777, 0600u);

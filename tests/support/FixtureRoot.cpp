@@ -7,7 +7,10 @@
 
 #include <sys/stat.h>
 
-FixtureRoot::FixtureRoot() = default;
+FixtureRoot::FixtureRoot(const QString &base)
+    : TemporaryRoot(base)
+{
+}
 
 QMap<QString, QByteArray> FixtureRoot::defaults()
 {

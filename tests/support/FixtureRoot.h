@@ -15,7 +15,7 @@
 class FixtureRoot : public TemporaryRoot
 {
 public:
-    FixtureRoot();
+    explicit FixtureRoot(const QString &base = QString());
 
     // Writes the default files, overridden by the given ones ("path" ->
     // content; a null QByteArray leaves a default file out).

@@ -6,8 +6,8 @@
 
 #include <sys/stat.h>
 
-TemporaryRoot::TemporaryRoot()
-    : m_dir(QDir::tempPath() + QStringLiteral("/ftpconfig-root-XXXXXX"))
+TemporaryRoot::TemporaryRoot(const QString &base)
+    : m_dir((base.isEmpty() ? QDir::tempPath() : base) + QStringLiteral("/ftpconfig-root-XXXXXX"))
 {
 }
 

@@ -9,7 +9,8 @@
 class TemporaryRoot
 {
 public:
-    TemporaryRoot();
+    // The directory is made below base: another file system, say.
+    explicit TemporaryRoot(const QString &base = QString());
 
     bool isValid() const;
     QString path() const;
