@@ -70,9 +70,9 @@ int main(int argc, char **argv)
             std::cout.rdbuf(out);
             throw;
         }
-        const QList<ReportRow> rows = buildReport(config, interaction);
+        const Report report = buildReport(config, interaction);
         std::cout.rdbuf(out);
-        const QByteArray text = json ? reportJson(rows, root.path()) : reportText(rows);
+        const QByteArray text = json ? reportJson(report, root.path()) : reportText(report);
         std::fwrite(text.constData(), 1, static_cast<size_t>(text.size()), stdout);
     } catch (const ProcessExit &exit) {
         return exit.status & 0xff;

@@ -112,7 +112,7 @@ Figures measure(const Sizes &sizes, int runs)
         config.load();
         figures.load = std::min(figures.load, ms(timer));
         timer.restart();
-        const QList<ReportRow> rows = buildReport(config, interaction);
+        const QList<ReportRow> rows = buildReport(config, interaction).rows;
         figures.evaluate = std::min(figures.evaluate, ms(timer));
         std::cout.rdbuf(out);
         figures.allowed

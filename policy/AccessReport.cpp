@@ -48,9 +48,13 @@ void ReportInteraction::exitProcess(int status)
     throw ProcessExit{status};
 }
 
-QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interaction)
+Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
 {
-    QList<ReportRow> rows;
+    Report report;
+    LoginForecast forecast(config);
+    report.serverFindings = forecast.serverFindings();
+    report.serverFails = forecast.serverFails();
+    QList<ReportRow> &rows = report.rows;
     const auto evaluate = [&](const QByteArray &name, const QString &kind) {
         ReportRow row;
         row.name = name;
@@ -59,6 +63,7 @@ QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interac
         row.allowed = config.checkAccess(name, false, &row.failure);
         row.directory = config.effectiveRoot(name);
         row.rights = rightsText(config.userRights(name));
+        row.forecast = forecast.forecast(name);
         if (!row.allowed && row.failure.message.isEmpty() && interaction.pamProblems > problemsBefore) {
             // The PAM check refuses without a message of its own when the
             // PAM file does not start its stacks with pam_userdb.so.
@@ -72,27 +77,61 @@ QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interac
     for (const auto &entry : config.accounts().virtualUsers())
         evaluate(entry.first, QStringLiteral("virtual"));
     evaluate(AppStrings::instance().anonymousUsers.toLocal8Bit(), QStringLiteral("anonymous"));
-    return rows;
+    return report;
 }
 
-QByteArray reportText(const QList<ReportRow> &rows)
+QString findingText(const ForecastFinding &finding)
 {
-    const QStringList header{QStringLiteral("USER"),      QStringLiteral("KIND"),   QStringLiteral("STATUS"),
-                             QStringLiteral("DIRECTORY"), QStringLiteral("RIGHTS"), QStringLiteral("FILE"),
-                             QStringLiteral("REASON")};
+    QString out;
+    if (!finding.file.isEmpty())
+        out += finding.file + (finding.line > 0 ? QStringLiteral(":%1").arg(finding.line) : QString())
+            + QStringLiteral(": ");
+    return out + finding.message;
+}
+
+namespace {
+
+QJsonArray findingsJson(const QList<ForecastFinding> &findings)
+{
+    QJsonArray array;
+    for (const ForecastFinding &finding : findings) {
+        array.append(QJsonObject{{QStringLiteral("severity"), severityText(finding.severity)},
+                                 {QStringLiteral("file"), finding.file},
+                                 {QStringLiteral("line"), finding.line},
+                                 {QStringLiteral("message"), finding.message}});
+    }
+    return array;
+}
+
+} // namespace
+
+QByteArray reportText(const Report &report)
+{
+    const QList<ReportRow> &rows = report.rows;
+    const QStringList header{QStringLiteral("USER"),   QStringLiteral("KIND"),      QStringLiteral("STATUS"),
+                             QStringLiteral("SERVER"), QStringLiteral("DIRECTORY"), QStringLiteral("RIGHTS"),
+                             QStringLiteral("FILE"),   QStringLiteral("REASON"),    QStringLiteral("SERVER SAYS")};
     QList<QStringList> table{header};
     const AppStrings &strings = AppStrings::instance();
     for (const ReportRow &row : rows) {
         const bool failed = !row.failure.message.isEmpty();
+        const QString said = row.forecast.findings.isEmpty() ? QString() : findingText(row.forecast.findings.first());
         table.append({QString::fromUtf8(row.name), row.kind, row.allowed ? strings.allowed : strings.denied,
-                      QString::fromUtf8(row.directory), row.rights.isEmpty() ? QStringLiteral("-") : row.rights,
-                      failed ? failureKindText(row.failure.kind) : QString(), row.failure.message});
+                      forecastStatusText(row.forecast.status), QString::fromUtf8(row.directory),
+                      row.rights.isEmpty() ? QStringLiteral("-") : row.rights,
+                      failed ? failureKindText(row.failure.kind) : QStringLiteral("-"),
+                      failed ? row.failure.message : QStringLiteral("-"), said});
     }
     QVector<int> widths(header.size(), 0);
     for (const QStringList &line : table)
         for (int i = 0; i < line.size(); ++i)
             widths[i] = std::max(widths[i], static_cast<int>(line[i].size()));
     QByteArray out;
+    for (const ForecastFinding &finding : report.serverFindings) {
+        out += QStringLiteral("server %1: %2\n").arg(severityText(finding.severity), findingText(finding)).toUtf8();
+    }
+    if (!report.serverFindings.isEmpty())
+        out += '\n';
     for (const QStringList &line : table) {
         QString text;
         for (int i = 0; i < line.size(); ++i)
@@ -102,8 +141,9 @@ QByteArray reportText(const QList<ReportRow> &rows)
     return out;
 }
 
-QByteArray reportJson(const QList<ReportRow> &rows, const QString &root)
+QByteArray reportJson(const Report &report, const QString &root)
 {
+    const QList<ReportRow> &rows = report.rows;
     QJsonArray users;
     const AppStrings &strings = AppStrings::instance();
     for (const ReportRow &row : rows) {
@@ -117,8 +157,14 @@ QByteArray reportJson(const QList<ReportRow> &rows, const QString &root)
             {QStringLiteral("failureKind"), failed ? static_cast<int>(row.failure.kind) : 0},
             {QStringLiteral("failureText"), failed ? failureKindText(row.failure.kind) : QString()},
             {QStringLiteral("message"), row.failure.message},
+            {QStringLiteral("forecast"),
+             QJsonObject{{QStringLiteral("status"), forecastStatusText(row.forecast.status)},
+                         {QStringLiteral("findings"), findingsJson(row.forecast.findings)}}},
         });
     }
-    const QJsonObject document{{QStringLiteral("root"), root}, {QStringLiteral("users"), users}};
+    const QJsonObject server{{QStringLiteral("fails"), report.serverFails},
+                             {QStringLiteral("findings"), findingsJson(report.serverFindings)}};
+    const QJsonObject document{
+        {QStringLiteral("root"), root}, {QStringLiteral("server"), server}, {QStringLiteral("users"), users}};
     return QJsonDocument(document).toJson(QJsonDocument::Indented);
 }

@@ -2,6 +2,7 @@
 
 #include "policy/AccessFailure.h"
 #include "policy/Interaction.h"
+#include "policy/LoginForecast.h"
 
 #include <QByteArray>
 #include <QList>
@@ -16,8 +17,16 @@ struct ReportRow
     QString kind; // "local", "virtual" or "anonymous"
     bool allowed = false;
     AccessFailure failure;
-    QByteArray directory; // the effective FTP root
-    QString rights; // as the table's mode column shows them
+    QByteArray directory;  // the effective FTP root
+    QString rights;        // as the table's mode column shows them
+    UserForecast forecast; // what the server itself will do
+};
+
+struct Report
+{
+    QList<ReportRow> rows;
+    QList<ForecastFinding> serverFindings;
+    bool serverFails = false;
 };
 
 // Answers every question without asking anybody and without repairing:
@@ -37,7 +46,9 @@ public:
 };
 
 // Every user of the table, local, virtual, then the anonymous row, with the
-// verdict of checkAccess without repair.
-QList<ReportRow> buildReport(FtpServerConfig &config, ReportInteraction &interaction);
-QByteArray reportText(const QList<ReportRow> &rows);
-QByteArray reportJson(const QList<ReportRow> &rows, const QString &root);
+// verdict of checkAccess without repair and the forecast beside it.
+Report buildReport(FtpServerConfig &config, ReportInteraction &interaction);
+QByteArray reportText(const Report &report);
+QByteArray reportJson(const Report &report, const QString &root);
+// "file:line: message", the parts that are known.
+QString findingText(const ForecastFinding &finding);

@@ -93,7 +93,10 @@ void FtpServerConfig::load()
     loadFtpusers();
     loadChrootList();
     loadUserConfigs();
-    if (!findData(m_main.elements, "", "listen") && !findData(m_main.elements, "", "listen_ipv6"))
+    // Read-only, the document stays as the file is: the forecast judges
+    // the file the server reads.
+    if (m_mode == Mode::ReadWrite && !findData(m_main.elements, "", "listen")
+        && !findData(m_main.elements, "", "listen_ipv6"))
         setValue(m_main.elements, "", "listen", "yes");
     loadVirtualUsers();
 }
@@ -104,6 +107,7 @@ void FtpServerConfig::loadMainConfig()
     const QString file = m_root.resolve(path);
     const std::string shown = QFile::encodeName(path).toStdString();
     if (!QFileInfo::exists(file)) {
+        m_mainConfigExisted = false;
         std::cout << shown << " not found" << std::endl;
         if (m_mode == Mode::ReadOnly) {
             m_main.parseText("listen=YES\n");
@@ -784,6 +788,11 @@ bool FtpServerConfig::createRootDirectory(const QByteArray &user, const QByteArr
 ConfigFile &FtpServerConfig::mainConfig()
 {
     return m_main;
+}
+
+bool FtpServerConfig::mainConfigExisted() const
+{
+    return m_mainConfigExisted;
 }
 
 ConfigFile &FtpServerConfig::pamConfig()

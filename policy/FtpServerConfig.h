@@ -110,6 +110,9 @@ public:
     bool isYes(const QByteArray &key, bool absentMeansYes = false) const;
 
     ConfigFile &mainConfig();
+    // False when the main configuration was missing at load (and, read-only,
+    // was only assumed to be "listen=YES").
+    bool mainConfigExisted() const;
     ConfigFile &pamConfig();
     const QByteArray &pamServiceName() const;
     const std::optional<FtpusersRule> &ftpusersRule() const;
@@ -165,6 +168,7 @@ private:
     Mode m_mode;
 
     ConfigFile m_main{SyntaxMode::KeyValue};
+    bool m_mainConfigExisted = true;
     ConfigFile m_pam{SyntaxMode::TokenLine};
     QByteArray m_pamServiceName;
     std::optional<FtpusersRule> m_ftpusersRule;

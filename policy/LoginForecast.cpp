@@ -1,0 +1,434 @@
+#include "LoginForecast.h"
+
+#include "policy/AppStrings.h"
+#include "policy/FtpServerConfig.h"
+#include "policy/PamForecast.h"
+
+#include <QFile>
+#include <QFileInfo>
+
+#include <fstream>
+#include <sys/stat.h>
+
+namespace {
+
+using Severity = ForecastFinding::Severity;
+
+QString text(const QByteArray &bytes)
+{
+    return QString::fromUtf8(bytes);
+}
+
+std::optional<QList<QByteArray>> readLines(const QString &path)
+{
+    QFile file(path);
+    if (!QFileInfo(path).isFile() || !file.open(QIODevice::ReadOnly))
+        return std::nullopt;
+    return file.readAll().split('\n');
+}
+
+} // namespace
+
+QString forecastStatusText(ForecastStatus status)
+{
+    switch (status) {
+    case ForecastStatus::Allowed:
+        return QStringLiteral("allowed");
+    case ForecastStatus::Denied:
+        return QStringLiteral("denied");
+    case ForecastStatus::Unknown:
+        break;
+    }
+    return QStringLiteral("unknown");
+}
+
+QString severityText(ForecastFinding::Severity severity)
+{
+    switch (severity) {
+    case Severity::Error:
+        return QStringLiteral("error");
+    case Severity::Warning:
+        return QStringLiteral("warning");
+    case Severity::Info:
+        break;
+    }
+    return QStringLiteral("info");
+}
+
+LoginForecast::LoginForecast(FtpServerConfig &config, QDate today)
+    : m_config(config)
+    , m_today(today)
+    , m_settings(config.mainConfig().elements)
+    , m_mainPath(AppStrings::instance().mainConfigPath)
+{
+    checkServer();
+}
+
+LoginForecast::~LoginForecast() = default;
+
+const QList<ForecastFinding> &LoginForecast::serverFindings() const
+{
+    return m_serverFindings;
+}
+
+bool LoginForecast::serverFails() const
+{
+    return m_serverFails;
+}
+
+void LoginForecast::checkServer()
+{
+    const auto error = [this](const QString &file, int line, const QString &message) {
+        m_serverFindings.append({Severity::Error, file, line, message});
+        m_serverFails = true;
+    };
+    const RootDirectory &root = m_config.root();
+    const AccountStore &accounts = m_config.accounts();
+    AccountRecord record;
+
+    if (!m_config.mainConfigExisted())
+        error(m_mainPath, 0, QStringLiteral("the file does not exist: vsftpd does not start"));
+    for (const auto &problem : m_settings.errors())
+        error(m_mainPath, problem.line, problem.message);
+    for (const auto &repeat : m_settings.repeats())
+        m_serverFindings.append({Severity::Warning, m_mainPath, repeat.line, repeat.message});
+
+    const bool listen = m_settings.isYes("listen", false);
+    const bool listen6 = m_settings.isYes("listen_ipv6", false);
+    if (listen && listen6) {
+        error(m_mainPath, m_settings.line("listen_ipv6"),
+              QStringLiteral("listen and listen_ipv6 are both YES: vsftpd refuses to start (one copy listens for "
+                             "IPv4, another for IPv6)"));
+    } else if (!listen && !listen6) {
+        error(m_mainPath, m_settings.line("listen"),
+              QStringLiteral("neither listen nor listen_ipv6 is YES: vsftpd does not listen by itself and every "
+                             "connection to the service fails"));
+    }
+
+    const bool local = m_settings.isYes("local_enable", false);
+    const bool anonymous = m_settings.isYes("anonymous_enable", true);
+    if (!local && !anonymous) {
+        error(m_mainPath, m_settings.line("local_enable"),
+              QStringLiteral("local_enable and anonymous_enable are both off: vsftpd ends every connection"));
+    }
+    if (anonymous) {
+        const QByteArray ftpUser = m_settings.value("ftp_username", "ftp");
+        if (!accounts.getUserInfo(ftpUser, record)) {
+            error(m_mainPath, m_settings.line("ftp_username"),
+                  QStringLiteral("anonymous logins are on, but the account %1 (ftp_username) does not exist: vsftpd "
+                                 "ends every connection")
+                      .arg(text(ftpUser)));
+        }
+    }
+    if (m_settings.isYes("guest_enable", false)) {
+        const QByteArray guest = m_settings.value("guest_username", "ftp");
+        if (!accounts.getUserInfo(guest, record)) {
+            error(m_mainPath, m_settings.line("guest_username"),
+                  QStringLiteral("guest_enable is on, but the account %1 (guest_username) does not exist: vsftpd "
+                                 "ends every connection")
+                      .arg(text(guest)));
+        }
+    }
+    const QByteArray nopriv = m_settings.value("nopriv_user", "nobody");
+    if (!accounts.getUserInfo(nopriv, record)) {
+        error(m_mainPath, m_settings.line("nopriv_user"),
+              QStringLiteral("the account %1 (nopriv_user) does not exist: vsftpd ends every connection")
+                  .arg(text(nopriv)));
+    }
+    const QByteArray secure = m_settings.value("secure_chroot_dir", "/var/run/vsftpd/empty");
+    if (!QFileInfo(root.resolve(text(secure))).isDir()) {
+        error(m_mainPath, m_settings.line("secure_chroot_dir"),
+              QStringLiteral("the directory %1 (secure_chroot_dir) does not exist: vsftpd ends every connection")
+                  .arg(text(secure)));
+    }
+    if (m_settings.isYes("userlist_enable", false)) {
+        m_userlistFile = m_settings.value("userlist_file", "/etc/vsftpd.user_list");
+        m_userlist = readLines(root.resolve(text(m_userlistFile)));
+        if (!m_userlist) {
+            error(m_mainPath, m_settings.line("userlist_file"),
+                  QStringLiteral("userlist_enable is on, but %1 cannot be read: vsftpd ends every connection")
+                      .arg(text(m_userlistFile)));
+        }
+    }
+    if (m_settings.isYes("chroot_list_enable", false))
+        m_chrootList = readLines(root.resolve(text(m_settings.value("chroot_list_file", "/etc/vsftpd.chroot_list"))));
+
+    // The PAM service the server uses: the last pam_service_name, which is
+    // the one the engine loaded unless the key is repeated.
+    const QByteArray service = m_settings.value("pam_service_name", "vsftpd");
+    const ConfigFile *serviceFile = &m_config.pamConfig();
+    static const ConfigFile empty(SyntaxMode::TokenLine);
+    if (service != m_config.pamServiceName()) {
+        auto file = std::make_unique<ConfigFile>(SyntaxMode::TokenLine);
+        std::ifstream in(QFile::encodeName(root.resolve(QStringLiteral("/etc/pam.d/") + text(service))).toStdString(),
+                         std::ios::in | std::ios::binary);
+        if (in.is_open())
+            file->parse(in);
+        m_ownPam = std::move(file);
+        serviceFile = m_ownPam.get();
+    }
+    m_pam = std::make_unique<PamForecast>(root, accounts, text(service), serviceFile ? *serviceFile : empty, m_today);
+}
+
+bool LoginForecast::isListed(const QByteArray &login) const
+{
+    if (!m_userlist)
+        return false;
+    for (QByteArray line : *m_userlist) {
+        if (line.endsWith('\r'))
+            line.chop(1);
+        if (line == login)
+            return true;
+    }
+    return false;
+}
+
+const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
+{
+    // The server reads per-user files only when user_config_dir is set.
+    if (!m_settings.contains("user_config_dir"))
+        return nullptr;
+    auto it = m_userFiles.find(login);
+    if (it == m_userFiles.end()) {
+        QByteArray directory = m_settings.value("user_config_dir");
+        if (!directory.endsWith('/'))
+            directory += '/';
+        std::unique_ptr<VsftpdSettings> settings;
+        const QString path = m_config.root().resolve(text(directory + login));
+        std::ifstream in(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
+        if (in.is_open() && QFileInfo(path).isFile()) {
+            ConfigFile file(SyntaxMode::KeyValue);
+            file.parse(in);
+            settings = std::make_unique<VsftpdSettings>(file.elements);
+        }
+        it = m_userFiles.emplace(login, std::move(settings)).first;
+    }
+    return it->second.get();
+}
+
+std::optional<ForecastFinding> LoginForecast::checkRoot(const QByteArray &account, const QByteArray &directory,
+                                                        bool chrooted, bool allowWriteable, const QString &what) const
+{
+    AccountRecord record;
+    m_config.accounts().getUserInfo(account, record);
+    const QString path = m_config.root().resolve(text(directory));
+    struct stat info
+    {
+    };
+    if (directory.isEmpty() || ::stat(QFile::encodeName(path).constData(), &info) != 0 || !S_ISDIR(info.st_mode)) {
+        return ForecastFinding{Severity::Error, QString(), 0,
+                               QStringLiteral("%1 %2 does not exist: vsftpd ends the session (cannot change "
+                                              "directory)")
+                                   .arg(what, text(directory))};
+    }
+    int shift = 0;
+    if (record.uid == 0)
+        shift = -1;
+    else if (info.st_uid == record.uid)
+        shift = 6;
+    else if (info.st_gid == record.gid || m_config.accounts().isUserInGroup(account, [&] {
+                 const auto group = m_config.accounts().groups().find(info.st_gid);
+                 return group == m_config.accounts().groups().end() ? QByteArray() : group->second.name;
+             }()))
+        shift = 3;
+    const bool enterable = shift < 0 || (info.st_mode & (S_IXOTH << shift));
+    const bool writable = shift < 0 || (info.st_mode & (S_IWOTH << shift));
+    if (!enterable) {
+        return ForecastFinding{Severity::Error, QString(), 0,
+                               QStringLiteral("%1 %2 cannot be entered by the account %3: vsftpd ends the session")
+                                   .arg(what, text(directory), text(account))};
+    }
+    if (chrooted && writable && !allowWriteable) {
+        return ForecastFinding{Severity::Error, QString(), 0,
+                               QStringLiteral("%1 %2 is writable by the account %3 and is the chroot: vsftpd refuses "
+                                              "(writable root inside chroot) unless allow_writeable_chroot=YES")
+                                   .arg(what, text(directory), text(account))};
+    }
+    return std::nullopt;
+}
+
+UserForecast LoginForecast::forecast(const QByteArray &user)
+{
+    if (m_serverFails) {
+        UserForecast result{ForecastStatus::Denied, {}};
+        for (const ForecastFinding &finding : m_serverFindings) {
+            if (finding.severity == Severity::Error)
+                result.findings.append(finding);
+        }
+        return result;
+    }
+    UserForecast result;
+    // The table's anonymous row, and the names vsftpd itself takes for
+    // anonymous logins while they are on.
+    const bool anonymousOn = m_settings.isYes("anonymous_enable", true);
+    if (user == AppStrings::instance().anonymousUsers.toLocal8Bit()
+        || (anonymousOn && (user == "anonymous" || user == "ftp")))
+        result = forecastAnonymous();
+    else
+        result = forecastLogin(user);
+    for (const ForecastFinding &finding : m_serverFindings)
+        result.findings.append(finding);
+    return result;
+}
+
+UserForecast LoginForecast::forecastAnonymous()
+{
+    const auto denied = [](const QString &file, int line, const QString &message) {
+        return UserForecast{ForecastStatus::Denied, {{Severity::Error, file, line, message}}};
+    };
+    if (!m_settings.isYes("anonymous_enable", true)) {
+        return denied(m_mainPath, m_settings.line("anonymous_enable"),
+                      QStringLiteral("anonymous_enable is off: vsftpd refuses anonymous logins"));
+    }
+    if (m_userlist) {
+        const bool deny = m_settings.isYes("userlist_deny", true);
+        const bool anonymousListed = isListed("anonymous");
+        const bool ftpListed = isListed("ftp");
+        if (deny && anonymousListed && ftpListed) {
+            return denied(text(m_userlistFile), 0,
+                          QStringLiteral("anonymous and ftp are listed in the userlist, and userlist_deny is on: "
+                                         "vsftpd refuses anonymous logins"));
+        }
+        if (!deny && !anonymousListed && !ftpListed) {
+            return denied(text(m_userlistFile), 0,
+                          QStringLiteral("neither anonymous nor ftp is listed in the userlist, and userlist_deny is "
+                                         "off: vsftpd refuses anonymous logins"));
+        }
+    }
+    const QByteArray account = m_settings.value("ftp_username", "ftp");
+    AccountRecord record;
+    m_config.accounts().getUserInfo(account, record);
+    const bool anonRoot = m_settings.contains("anon_root");
+    const QByteArray root = anonRoot ? m_settings.value("anon_root") : record.home;
+    const QString what = anonRoot ? QStringLiteral("the anonymous root (anon_root)")
+                                  : QStringLiteral("the anonymous root (home of %1)").arg(text(account));
+    if (auto problem = checkRoot(account, root, true, m_settings.isYes("allow_writeable_chroot", false), what)) {
+        if (anonRoot) {
+            problem->file = m_mainPath;
+            problem->line = m_settings.line("anon_root");
+        }
+        return UserForecast{ForecastStatus::Denied, {*problem}};
+    }
+    return UserForecast{ForecastStatus::Allowed, {}};
+}
+
+UserForecast LoginForecast::forecastLogin(const QByteArray &login)
+{
+    UserForecast result{ForecastStatus::Allowed, {}};
+    const auto deny = [&](const QString &file, int line, const QString &message) {
+        result.findings.prepend({Severity::Error, file, line, message});
+        result.status = ForecastStatus::Denied;
+        return result;
+    };
+    if (!m_settings.isYes("local_enable", false)) {
+        return deny(m_mainPath, m_settings.line("local_enable"),
+                    QStringLiteral("local_enable is off: vsftpd admits anonymous logins only"));
+    }
+    if (m_userlist) {
+        const bool deny_ = m_settings.isYes("userlist_deny", true);
+        const bool listed = isListed(login);
+        if (deny_ && listed) {
+            return deny(text(m_userlistFile), 0,
+                        QStringLiteral("%1 is listed in the userlist and userlist_deny is on: vsftpd refuses before "
+                                       "asking the password")
+                            .arg(text(login)));
+        }
+        if (!deny_ && !listed) {
+            return deny(text(m_userlistFile), 0,
+                        QStringLiteral("%1 is not listed in the userlist and userlist_deny is off: vsftpd refuses "
+                                       "before asking the password")
+                            .arg(text(login)));
+        }
+    }
+
+    const PamForecast::Result pam = m_pam->evaluate(login);
+    if (pam.outcome == PamForecast::Outcome::Failure)
+        return deny(pam.file, pam.line, pam.message);
+    if (pam.outcome == PamForecast::Outcome::Unknown) {
+        result.status = ForecastStatus::Unknown;
+        result.findings.append({Severity::Warning, pam.file, pam.line, pam.message});
+    }
+
+    const AccountStore &accounts = m_config.accounts();
+    const bool guest = m_settings.isYes("guest_enable", false);
+    const QByteArray account = guest ? m_settings.value("guest_username", "ftp") : login;
+    AccountRecord record;
+    if (!accounts.getUserInfo(account, record)) {
+        return deny(m_mainPath, m_settings.line("guest_enable"),
+                    QStringLiteral("PAM admits %1, but there is no system account %1 and guest_enable is off: vsftpd "
+                                   "ends the session")
+                        .arg(text(login)));
+    }
+
+    const VsftpdSettings *own = userSettings(login);
+    QByteArray ownDirectory = m_settings.value("user_config_dir");
+    if (!ownDirectory.endsWith('/'))
+        ownDirectory += '/';
+    const QString ownPath = text(ownDirectory + login);
+    if (own && !own->errors().isEmpty()) {
+        const auto &problem = own->errors().first();
+        return deny(ownPath, problem.line, problem.message);
+    }
+    const auto setting = [&](const QByteArray &key) -> const VsftpdSettings::Setting * {
+        if (own) {
+            if (const auto *value = own->find(key))
+                return value;
+        }
+        return m_settings.find(key);
+    };
+    const auto yes = [&](const QByteArray &key, bool defaultValue) {
+        if (own && own->contains(key))
+            return own->isYes(key, defaultValue);
+        return m_settings.isYes(key, defaultValue);
+    };
+
+    bool chrooted = false;
+    if (guest && !yes("virtual_use_local_privs", false)) {
+        chrooted = true;
+    } else {
+        chrooted = yes("chroot_local_user", false);
+        if (yes("chroot_list_enable", false)) {
+            if (!m_chrootList) {
+                return deny(m_mainPath, m_settings.line("chroot_list_enable"),
+                            QStringLiteral("chroot_list_enable is on, but the chroot list %1 cannot be read: vsftpd "
+                                           "ends every local login")
+                                .arg(text(m_settings.value("chroot_list_file", "/etc/vsftpd.chroot_list"))));
+            }
+            bool listed = false;
+            for (QByteArray line : *m_chrootList) {
+                if (line.endsWith('\r'))
+                    line.chop(1);
+                listed = listed || line == login;
+            }
+            if (listed)
+                chrooted = !chrooted;
+        }
+    }
+
+    // The session starts in the home of its account; a local_root that
+    // exists replaces it, one that does not is passed over.
+    const QString homeWhat = QStringLiteral("the home directory of %1").arg(text(account));
+    if (auto problem = checkRoot(account, record.home, false, true, homeWhat))
+        return deny(problem->file, problem->line, problem->message);
+    QByteArray root = record.home;
+    QString rootWhat = homeWhat;
+    if (const auto *localRoot = setting("local_root")) {
+        QByteArray directory = localRoot->value;
+        const QByteArray token = setting("user_sub_token") ? setting("user_sub_token")->value : QByteArray();
+        if (!token.isEmpty())
+            directory.replace(token, login);
+        if (QFileInfo(m_config.root().resolve(text(directory))).isDir()) {
+            root = directory;
+            rootWhat = QStringLiteral("the local_root");
+        } else {
+            result.findings.append({Severity::Info, m_mainPath, localRoot->line,
+                                    QStringLiteral("local_root %1 does not exist: the session starts in %2")
+                                        .arg(text(directory), text(record.home))});
+        }
+    }
+    if (chrooted) {
+        if (auto problem = checkRoot(account, root, true, yes("allow_writeable_chroot", false), rootWhat))
+            return deny(problem->file, problem->line, problem->message);
+    }
+    return result;
+}

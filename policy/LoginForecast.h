@@ -1,0 +1,80 @@
+#pragma once
+
+#include "config/ConfigFile.h"
+#include "policy/VsftpdSettings.h"
+
+#include <QByteArray>
+#include <QDate>
+#include <QList>
+#include <QString>
+
+#include <map>
+#include <memory>
+#include <optional>
+
+class FtpServerConfig;
+class PamForecast;
+
+struct ForecastFinding
+{
+    enum class Severity { Error, Warning, Info };
+    Severity severity = Severity::Error;
+    QString file; // as the administrator knows it; empty when no file is to blame
+    int line = 0; // 1-based; 0 when no line is
+    QString message;
+};
+
+enum class ForecastStatus { Allowed, Denied, Unknown };
+
+struct UserForecast
+{
+    ForecastStatus status = ForecastStatus::Unknown;
+    QList<ForecastFinding> findings; // the deciding one first
+};
+
+// What vsftpd itself will do when a user logs in with the right password,
+// judged from the files the engine loaded, by the server's own rules and
+// defaults (vsftpd 3.0.3 as Debian 12 builds it): the configuration as the
+// server parses it, the userlist, PAM, the session's account, its home and
+// chroot. Nothing is started and nothing is changed. It stands beside the
+// verdict of checkAccess and never replaces it.
+class LoginForecast
+{
+public:
+    explicit LoginForecast(FtpServerConfig &config, QDate today = QDate::currentDate());
+    ~LoginForecast();
+
+    // Problems with which the server does not start or fails every
+    // connection (errors), and notes about the configuration.
+    const QList<ForecastFinding> &serverFindings() const;
+    bool serverFails() const;
+
+    // A user of the table: a local account, a virtual user, or the
+    // anonymous row.
+    UserForecast forecast(const QByteArray &user);
+
+private:
+    UserForecast forecastAnonymous();
+    UserForecast forecastLogin(const QByteArray &login);
+    void checkServer();
+    bool isListed(const QByteArray &login) const;
+    std::optional<ForecastFinding> checkRoot(const QByteArray &account, const QByteArray &directory, bool chrooted,
+                                             bool allowWriteable, const QString &what) const;
+    const VsftpdSettings *userSettings(const QByteArray &login);
+
+    FtpServerConfig &m_config;
+    QDate m_today;
+    VsftpdSettings m_settings;
+    QString m_mainPath;
+    QList<ForecastFinding> m_serverFindings;
+    bool m_serverFails = false;
+    QByteArray m_userlistFile;
+    std::optional<QList<QByteArray>> m_userlist;
+    std::optional<QList<QByteArray>> m_chrootList;
+    std::unique_ptr<ConfigFile> m_ownPam; // when the server's service is another
+    std::unique_ptr<PamForecast> m_pam;
+    std::map<QByteArray, std::unique_ptr<VsftpdSettings>> m_userFiles;
+};
+
+QString forecastStatusText(ForecastStatus status);
+QString severityText(ForecastFinding::Severity severity);

@@ -1,0 +1,56 @@
+#pragma once
+
+#include "config/ConfigFile.h"
+
+#include <QByteArray>
+#include <QList>
+#include <QString>
+
+#include <map>
+
+// A configuration file read the way vsftpd 3.0.3 reads it: every line that
+// is not empty and does not begin with "#" is "key=value" with nothing
+// trimmed; an unknown key or a bad yes/no value stops the server; a repeated
+// key takes its last value.
+class VsftpdSettings
+{
+public:
+    enum class Kind { Unknown, Bool, Number, String };
+
+    struct Setting
+    {
+        QByteArray value;
+        int line = 0; // 1-based; 0 for a line added in memory
+    };
+
+    struct Problem
+    {
+        int line = 0;
+        QString message;
+    };
+
+    // Reads the elements of a parsed file (the main configuration or a
+    // per-user file).
+    explicit VsftpdSettings(const ConfigElementList &elements);
+
+    static Kind kindOf(const QByteArray &key);
+
+    // Lines the server refuses to start with.
+    const QList<Problem> &errors() const;
+    // Keys set more than once: the server takes the last value.
+    const QList<Problem> &repeats() const;
+
+    bool contains(const QByteArray &key) const;
+    const Setting *find(const QByteArray &key) const;
+    QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;
+    // YES, TRUE and 1 in any case are yes; absent keys take the default.
+    bool isYes(const QByteArray &key, bool defaultValue) const;
+    int line(const QByteArray &key) const;
+
+private:
+    void readLine(const QByteArray &key, const QByteArray &value, int line, bool hasEquals);
+
+    std::map<QByteArray, Setting> m_settings;
+    QList<Problem> m_errors;
+    QList<Problem> m_repeats;
+};
