@@ -17,8 +17,8 @@ struct ReportRow
     QString kind; // "local", "virtual" or "anonymous"
     bool allowed = false;
     AccessFailure failure;
-    QByteArray directory;  // the effective FTP root
-    QString rights;        // as the table's mode column shows them
+    QByteArray directory; // the effective FTP root
+    QString rights; // as the table's mode column shows them
     UserForecast forecast; // what the server itself will do
 };
 

@@ -451,8 +451,8 @@ PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const
                         state.reason += QStringLiteral(", reached because %1").arg(state.passedOver);
                 }
             };
-            if (*code != Success && *code != Ignore && !reason.isEmpty() &&
-                (action.action == Action::Ignore || action.action == Action::Jump)) {
+            if (*code != Success && *code != Ignore && !reason.isEmpty()
+                && (action.action == Action::Ignore || action.action == Action::Jump)) {
                 state.passedOver = QStringLiteral("%1 (%2:%3) answered: %4")
                                        .arg(QString::fromUtf8(line.module), line.file)
                                        .arg(line.line)
