@@ -3,6 +3,7 @@
 // Usage: benchverdicts [accounts] [virtual-users] [userlist-names] [runs]
 #include "policy/AccessReport.h"
 #include "policy/FtpServerConfig.h"
+#include "policy/LoginForecast.h"
 
 #include <QCoreApplication>
 #include <QDir>
@@ -31,8 +32,10 @@ struct Figures
     double rawRead = 1e12;
     double load = 1e12;
     double evaluate = 1e12;
+    double forecast = 1e12;
     int allowed = 0;
     int denied = 0;
+    int forecastAllowed = 0;
 };
 
 void writeFile(const QString &path, const QByteArray &content)
@@ -45,7 +48,8 @@ void writeFile(const QString &path, const QByteArray &content)
 
 void generate(const QString &root, const Sizes &sizes)
 {
-    QByteArray passwd = "root:x:0:0::/root:/bin/sh\nftp:x:107:113::/srv/ftp:/usr/sbin/nologin\n";
+    QByteArray passwd = "root:x:0:0::/root:/bin/sh\nftp:x:107:113::/srv/ftp:/usr/sbin/nologin\n"
+                        "nobody:x:65534:65534::/nonexistent:/usr/sbin/nologin\n";
     QByteArray shadow = "root:*:19000:0:99999:7:::\nftp:*:19000:0:99999:7:::\n";
     QByteArray group = "root:x:0:\nftp:x:113:\n";
     for (int i = 0; i < sizes.accounts; ++i) {
@@ -73,6 +77,8 @@ void generate(const QString &root, const Sizes &sizes)
     writeFile(root + "/etc/ftpusers", "root\nuser7\n");
     writeFile(root + "/etc/vsftpd.d/allowed_user_list.conf", userlist);
     QDir().mkpath(root + "/srv/ftp");
+    QDir().mkpath(root + "/var/run/vsftpd/empty");
+    writeFile(root + "/etc/shells", "/bin/sh\n/bin/bash\n");
     QDir().mkpath(root + "/etc/vsftpd.d/users.d");
     QDir().mkpath(root + "/var/lib/ftpconfig");
     QProcess load;
@@ -111,13 +117,27 @@ Figures measure(const Sizes &sizes, int runs)
         FtpServerConfig config(interaction, RootDirectory(dir.path()));
         config.load();
         figures.load = std::min(figures.load, ms(timer));
+        QList<QByteArray> users;
+        for (const auto &entry : config.accounts().accounts())
+            users << entry.first;
+        for (const auto &entry : config.accounts().virtualUsers())
+            users << entry.first;
+        users << "Anonymous users";
         timer.restart();
-        const QList<ReportRow> rows = buildReport(config, interaction).rows;
+        int allowed = 0;
+        for (const QByteArray &user : users)
+            allowed += config.checkAccess(user, false) ? 1 : 0;
         figures.evaluate = std::min(figures.evaluate, ms(timer));
+        timer.restart();
+        LoginForecast forecast(config);
+        int forecastAllowed = 0;
+        for (const QByteArray &user : users)
+            forecastAllowed += forecast.forecast(user).status == ForecastStatus::Allowed ? 1 : 0;
+        figures.forecast = std::min(figures.forecast, ms(timer));
         std::cout.rdbuf(out);
-        figures.allowed
-            = static_cast<int>(std::count_if(rows.begin(), rows.end(), [](const ReportRow &r) { return r.allowed; }));
-        figures.denied = rows.size() - figures.allowed;
+        figures.allowed = allowed;
+        figures.denied = users.size() - allowed;
+        figures.forecastAllowed = forecastAllowed;
         Q_UNUSED(bytes);
     }
     return figures;
@@ -137,10 +157,10 @@ int main(int argc, char **argv)
     const Figures n = measure(base, runs);
     const Figures n2 = measure(doubled, runs);
     for (const auto &[sizes, f] : {std::pair<Sizes, Figures>{base, n}, {doubled, n2}}) {
-        std::printf("accounts %d, virtual %d, userlist %d: raw read %.1f ms, load %.1f ms, evaluate %.1f ms "
-                    "(%d allowed, %d denied)\n",
+        std::printf("accounts %d, virtual %d, userlist %d: raw read %.1f ms, load %.1f ms, verdicts %.1f ms "
+                    "(%d allowed, %d denied), forecast %.1f ms (%d allowed), forecast/verdicts %.2f\n",
                     sizes.accounts, sizes.virtualUsers, sizes.userlist, f.rawRead, f.load, f.evaluate, f.allowed,
-                    f.denied);
+                    f.denied, f.forecast, f.forecastAllowed, f.forecast / f.evaluate);
     }
     std::printf("t(2N)/t(N): load %.2f, evaluate %.2f, load+evaluate %.2f (best of %d)\n", n2.load / n.load,
                 n2.evaluate / n.evaluate, (n2.load + n2.evaluate) / (n.load + n.evaluate), runs);
