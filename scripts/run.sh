@@ -7,5 +7,5 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/install-deps.sh run
-scripts/build.sh build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DWITH_TESTS=OFF -DWITH_BENCHMARKS=OFF
+scripts/build.sh build -DCMAKE_BUILD_TYPE=RelWithDebInfo
 exec build/ftpconfig-report "$@"
