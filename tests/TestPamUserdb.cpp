@@ -90,33 +90,34 @@ void TestPamUserdb::pamReadsTheStore()
                 "account required pam_deny.so\n");
     pam.close();
 
-    AccountStore store(DbPath, RootDirectory(root.path()));
-    store.addVirtualUser("anna", "a1");
-    store.addVirtualUser("ben", "b 2");
-    store.addVirtualUser("carl", "c3");
-    store.saveVirtualUsers();
-    expectLogins({{"anna", "a1", true},
-                  {"anna", "a2", false},
-                  {"anna", "", false},
-                  {"ben", "b 2", true},
-                  {"ben", "b", false},
-                  {"carl", "c3", true},
-                  {"dora", "c3", false}},
-                 "first save");
+    {
+        AccountStore store(DbPath, RootDirectory(root.path()));
+        store.addVirtualUser("anna", "a1");
+        store.addVirtualUser("ben", "b 2");
+        store.addVirtualUser("carl", "c3");
+        store.saveVirtualUsers();
+        expectLogins({{"anna", "a1", true},
+                      {"anna", "a2", false},
+                      {"anna", "", false},
+                      {"ben", "b 2", true},
+                      {"ben", "b", false},
+                      {"carl", "c3", true},
+                      {"dora", "c3", false}},
+                     "first save");
 
-    store.changeVirtualUser("anna", "anne", {});
-    store.saveVirtualUsers();
-    expectLogins({{"anne", "a1", true}, {"anna", "a1", false}}, "after a rename");
+        store.changeVirtualUser("anna", "anne", {});
+        store.saveVirtualUsers();
+        expectLogins({{"anne", "a1", true}, {"anna", "a1", false}}, "after a rename");
 
-    store.changeVirtualUser("ben", "ben", "new secret");
-    store.saveVirtualUsers();
-    expectLogins({{"ben", "new secret", true}, {"ben", "b 2", false}}, "after a password change");
+        store.changeVirtualUser("ben", "ben", "new secret");
+        store.saveVirtualUsers();
+        expectLogins({{"ben", "new secret", true}, {"ben", "b 2", false}}, "after a password change");
 
-    store.removeVirtualUser("carl");
-    store.saveVirtualUsers();
-    expectLogins({{"carl", "c3", false}, {"anne", "a1", true}, {"ben", "new secret", true}}, "after a delete");
-
-    // A second program run sees the same users.
+        store.removeVirtualUser("carl");
+        store.saveVirtualUsers();
+        expectLogins({{"carl", "c3", false}, {"anne", "a1", true}, {"ben", "new secret", true}}, "after a delete");
+    }
+    // A later program run sees the same users.
     const AccountStore reloaded(DbPath, RootDirectory(root.path()));
     QCOMPARE(reloaded.virtualUsers().size(), size_t(2));
     QVERIFY(reloaded.isVirtualUser("anne"));

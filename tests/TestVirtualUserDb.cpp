@@ -373,20 +373,22 @@ void TestVirtualUserDb::recreateKeepsOnlyEdits()
         store.syncVirtualUsers();
     }
 
-    AccountStore later(configured, RootDirectory(root.path()));
-    later.changeVirtualUser("ben", "ben", "b2");
-    CaptureStream err(std::cerr);
-    later.recreateVirtualUserDb();
-    later.syncVirtualUsers();
-    // Unchanged records are not rewritten; the copy still has them.
-    QCOMPARE(dumped(root.filePath(DbFile)), afterSave);
-    const QByteArray backup = later.database()->lastBackupPath();
-    QCOMPARE(backup.isEmpty(), copy.isEmpty());
-    if (!copy.isEmpty())
-        QCOMPARE(dumped(root.filePath(QString::fromUtf8(backup))), copy);
-    QVERIFY(QString::fromStdString(err.text()).contains(QRegularExpression("\nRemovinglog\\.0+1\n")));
-
-    // What the re-created file holds survives another program run.
+    {
+        AccountStore later(configured, RootDirectory(root.path()));
+        later.changeVirtualUser("ben", "ben", "b2");
+        CaptureStream err(std::cerr);
+        later.recreateVirtualUserDb();
+        later.syncVirtualUsers();
+        // Unchanged records are not rewritten; the copy still has them.
+        QCOMPARE(dumped(root.filePath(DbFile)), afterSave);
+        const QByteArray backup = later.database()->lastBackupPath();
+        QCOMPARE(backup.isEmpty(), copy.isEmpty());
+        if (!copy.isEmpty())
+            QCOMPARE(dumped(root.filePath(QString::fromUtf8(backup))), copy);
+        QVERIFY(QString::fromStdString(err.text()).contains(QRegularExpression("\nRemovinglog\\.0+1\n")));
+    }
+    // What the re-created file holds survives another program run (one
+    // at a time: the environment is not shared).
     const AccountStore reloaded(configured, RootDirectory(root.path()));
     QCOMPARE(reloaded.virtualUsers().at("ben").password, QByteArray("b2"));
 }
