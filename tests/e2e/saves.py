@@ -36,6 +36,8 @@ import tempfile
 import time
 from typing import Dict, FrozenSet, List, Optional, Tuple
 
+# Run from the source tree: no compiled copy of the harness left beside it.
+sys.dont_write_bytecode = True
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
 import verdicts as harness  # noqa: E402  (the shared harness lives next to this file)
 from verdicts import ALLOWED, DENIED, Account, SetupError  # noqa: E402
