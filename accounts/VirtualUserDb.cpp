@@ -161,24 +161,20 @@ void VirtualUserDb::open()
 
 void VirtualUserDb::close()
 {
-    if (m_db) {
+    const auto closeQuietly = [this](auto &handle) {
+        if (!handle)
+            return;
         try {
-            m_db->close(0);
+            handle->close(0);
         } catch (const std::exception &e) {
             std::cerr << "Error closing database: " << m_filePath.constData() << "\n" << e.what() << std::endl;
         }
-        m_db.reset();
-    }
+        handle.reset();
+    };
+    closeQuietly(m_db);
     // Closing the environment too lets the next open run recovery alone
     // and frees its regions.
-    if (m_env) {
-        try {
-            m_env->close(0);
-        } catch (const std::exception &e) {
-            std::cerr << "Error closing database: " << m_filePath.constData() << "\n" << e.what() << std::endl;
-        }
-        m_env.reset();
-    }
+    closeQuietly(m_env);
     m_open = false;
 }
 
@@ -215,16 +211,14 @@ std::vector<std::pair<QByteArray, QByteArray>> VirtualUserDb::readAll()
     return records;
 }
 
-void VirtualUserDb::put(const QByteArray &name, const QByteArray &password)
+void VirtualUserDb::inTransaction(const std::function<void(DbTxn *)> &write)
 {
     if (!m_open || m_access == Access::ReadOnly)
         throw DbException("the virtual users database is not open for writing", EINVAL);
     DbTxn *txn = nullptr;
     m_env->txn_begin(nullptr, &txn, 0);
     try {
-        Dbt key = bytes(name);
-        Dbt data = bytes(password);
-        m_db->put(txn, &key, &data, 0);
+        write(txn);
         txn->commit(0);
     } catch (...) {
         abortQuietly(txn);
@@ -232,20 +226,21 @@ void VirtualUserDb::put(const QByteArray &name, const QByteArray &password)
     }
 }
 
+void VirtualUserDb::put(const QByteArray &name, const QByteArray &password)
+{
+    inTransaction([&](DbTxn *txn) {
+        Dbt key = bytes(name);
+        Dbt data = bytes(password);
+        m_db->put(txn, &key, &data, 0);
+    });
+}
+
 void VirtualUserDb::del(const QByteArray &name)
 {
-    if (!m_open || m_access == Access::ReadOnly)
-        throw DbException("the virtual users database is not open for writing", EINVAL);
-    DbTxn *txn = nullptr;
-    m_env->txn_begin(nullptr, &txn, 0);
-    try {
+    inTransaction([&](DbTxn *txn) {
         Dbt key = bytes(name);
         m_db->del(txn, &key, 0); // an absent key is no error
-        txn->commit(0);
-    } catch (...) {
-        abortQuietly(txn);
-        throw;
-    }
+    });
 }
 
 void VirtualUserDb::recreate(const QByteArray &configuredPath)

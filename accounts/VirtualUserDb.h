@@ -5,12 +5,14 @@
 #include <QByteArray>
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <utility>
 #include <vector>
 
 class Db;
 class DbEnv;
+class DbTxn;
 
 enum class VirtualUserState : uint32_t {
     Unchanged = 0,
@@ -72,6 +74,8 @@ public:
 
 private:
     void openEnvironment();
+    // Runs one write in a transaction of its own; aborted when it throws.
+    void inTransaction(const std::function<void(DbTxn *)> &write);
     void ensurePrivateMode() const;
 
     RootDirectory m_root;
