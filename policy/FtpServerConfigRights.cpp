@@ -207,6 +207,11 @@ void FtpServerConfig::checkFolderPermissions(const QByteArray &user, const QStri
 {
     const AppStrings &strings = AppStrings::instance();
     const QByteArray directory = effectiveRoot(user);
+    // A user who is not confined has "/" as its root: the session starts in
+    // its home and the bits of "/" are not the user's business. Opening "/"
+    // to everybody would be.
+    if (directory == "/")
+        return;
     const QString shown = text(directory);
     const QByteArray onDisk = QFile::encodeName(resolved(directory));
     struct stat info

@@ -136,6 +136,11 @@ bool FtpServerConfig::save()
     m_userlistPath = value("userlist_file", "/etc/vsftpd.d/allowed_user_list.conf");
     ok = saveNameList(m_userlistPath, m_userlist) && ok;
     setValue(m_main.elements, "", "userlist_enable", "yes");
+    // The server's own default is another file (/etc/vsftpd.user_list): an
+    // enabled list it cannot read would stop every login, so the server is
+    // told which file the program keeps.
+    if (!findData(m_main.elements, "", "userlist_file"))
+        appendData(m_main.elements, "userlist_file", m_userlistPath.toStdString());
     m_userlistModified = false;
 
     // 3. Chroot list.

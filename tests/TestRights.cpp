@@ -74,6 +74,7 @@ private slots:
     void setChrooted();
     void folderPermissions_data();
     void folderPermissions();
+    void rootOfAnUnconfinedUserIsLeftAlone();
     void createRootDirectory_data();
     void createRootDirectory();
 };
@@ -388,6 +389,19 @@ void TestRights::folderPermissions()
     QCOMPARE(shown, texts);
     QCOMPARE(mode(path), modeAfter);
     QVERIFY(engine.interaction.allAnswersUsed());
+}
+
+void TestRights::rootOfAnUnconfinedUserIsLeftAlone()
+{
+    Engine engine;
+    QVERIFY(engine.load({{"/etc/vsftpd.conf", "local_enable=YES\n"}}));
+    QCOMPARE(engine.config->effectiveRoot("bob"), QByteArray("/"));
+    const QByteArray root = QFile::encodeName(engine.root.path());
+    QCOMPARE(::chmod(root.constData(), 0755), 0);
+    engine.interaction.answers << Interaction::Button::Yes << Interaction::Button::Yes;
+    engine.config->checkFolderPermissions("bob", {"full access"});
+    QCOMPARE(mode(engine.root.path()), QStringLiteral("rwxr-xr-x"));
+    QCOMPARE(engine.interaction.records.size(), 0);
 }
 
 void TestRights::createRootDirectory_data()

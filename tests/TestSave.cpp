@@ -110,6 +110,7 @@ private slots:
     void writerReplacesSymlinks();
     void writerRefusesDirectories();
     void hiddenFilesAreNoUsers();
+    void serverReadsTheProgramsUserlist();
 };
 
 void TestSave::initTestCase()
@@ -314,6 +315,20 @@ void TestSave::hiddenFilesAreNoUsers()
     for (const auto &entry : engine.config->userConfigs())
         users << QString::fromUtf8(entry.first);
     QCOMPARE(users, (QStringList{"alice", "bob"}));
+}
+
+void TestSave::serverReadsTheProgramsUserlist()
+{
+    // Debian's configuration names no userlist: once a save enables the
+    // list, vsftpd must be told which file the program keeps, or it looks
+    // for its own default, finds nothing and refuses every login.
+    Engine engine;
+    QVERIFY(engine.load({{"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\n"}}));
+    QVERIFY(engine.config->save());
+    QCOMPARE(engine.root.readFile("/etc/vsftpd.conf"),
+             QByteArray("listen=YES\nlocal_enable=YES\nuserlist_enable=yes\n"
+                        "userlist_file=/etc/vsftpd.d/allowed_user_list.conf\n"));
+    QVERIFY(engine.root.exists("/etc/vsftpd.d/allowed_user_list.conf"));
 }
 
 QTEST_GUILESS_MAIN(TestSave)

@@ -272,8 +272,9 @@ SCENARIOS: List[Scenario] = [
     Scenario(
         "grant-debian-defaults",
         # Debian's settings: no userlist, no per-user directory. Every save
-        # writes userlist_enable=yes, and without userlist_file vsftpd then
-        # reads /etc/vsftpd.user_list, which Debian does not ship.
+        # enables the userlist and names the file the program keeps, which
+        # it creates; without the name vsftpd would read its own default,
+        # /etc/vsftpd.user_list, which Debian does not ship.
         ANONYMOUS_ON + ["local_enable=NO"],
         edit=("grant", ALICE),
         accounts=[Account(ALICE)],
@@ -287,11 +288,6 @@ SCENARIOS: List[Scenario] = [
             "/etc/vsftpd.d/allowed_user_list.conf": CREATED,
             "/etc/vsftpd.chroot_list": CREATED,
         },
-        known_fault=fault(
-            "the save turns the userlist on (userlist_enable=yes) without naming its file; vsftpd then "
-            "reads /etc/vsftpd.user_list, which does not exist, and refuses every session",
-            "after:start",
-        ),
     ),
     # Rights: "write" through a per-user file, write_enable=NO in the main file.
     Scenario(
