@@ -326,6 +326,22 @@ SCENARIOS: List[Scenario] = [
         files={"{tmp}/user_list": ["e2ealice"]},
         users={"e2ealice": OK, ANONYMOUS: refused(USERLIST_NO)},
     ),
+    Scenario(
+        "userlist-deny-names-anonymous",
+        # The list is looked up with the name typed: "anonymous" is refused
+        # (an "ftp" login would not be).
+        BOTH_ON + ["userlist_enable=YES", "userlist_file={tmp}/user_list"],
+        accounts=users("e2ealice"),
+        files={"{tmp}/user_list": ["anonymous"]},
+        users={"e2ealice": OK, ANONYMOUS: refused(USERLIST_NO, bug="userlist-anonymous-login-name")},
+    ),
+    Scenario(
+        "userlist-allow-names-ftp",
+        BOTH_ON + ["userlist_enable=YES", "userlist_deny=NO", "userlist_file={tmp}/user_list"],
+        accounts=users("e2ealice"),
+        files={"{tmp}/user_list": ["e2ealice", "ftp"]},
+        users={"e2ealice": OK, ANONYMOUS: refused(USERLIST_NO, bug="userlist-anonymous-login-name")},
+    ),
     # --- PAM: which service, and anonymous logins ---------------------------------
     Scenario(
         "pam-service-default",
