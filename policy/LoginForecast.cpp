@@ -207,7 +207,8 @@ const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
 }
 
 std::optional<ForecastFinding> LoginForecast::checkRoot(const QByteArray &account, const QByteArray &directory,
-                                                        bool chrooted, bool allowWriteable, const QString &what) const
+                                                        bool chrooted, bool allowWriteable, bool mustEnter,
+                                                        const QString &what) const
 {
     AccountRecord record;
     m_config.accounts().getUserInfo(account, record);
@@ -233,7 +234,7 @@ std::optional<ForecastFinding> LoginForecast::checkRoot(const QByteArray &accoun
         shift = 3;
     const bool enterable = shift < 0 || (info.st_mode & (S_IXOTH << shift));
     const bool writable = shift < 0 || (info.st_mode & (S_IWOTH << shift));
-    if (!enterable) {
+    if (mustEnter && !enterable) {
         return ForecastFinding{Severity::Error, QString(), 0,
                                QStringLiteral("%1 %2 cannot be entered by the account %3: vsftpd ends the session")
                                    .arg(what, text(directory), text(account))};
@@ -280,19 +281,20 @@ UserForecast LoginForecast::forecastAnonymous()
         return denied(m_mainPath, m_settings.line("anonymous_enable"),
                       QStringLiteral("anonymous_enable is off: vsftpd refuses anonymous logins"));
     }
+    // The list is looked up with the name typed at login, "anonymous" for
+    // the table's row ("ftp" would be looked up as itself).
     if (m_userlist) {
         const bool deny = m_settings.isYes("userlist_deny", true);
-        const bool anonymousListed = isListed("anonymous");
-        const bool ftpListed = isListed("ftp");
-        if (deny && anonymousListed && ftpListed) {
+        const bool listed = isListed("anonymous");
+        if (deny && listed) {
             return denied(text(m_userlistFile), 0,
-                          QStringLiteral("anonymous and ftp are listed in the userlist, and userlist_deny is on: "
-                                         "vsftpd refuses anonymous logins"));
+                          QStringLiteral("anonymous is listed in the userlist and userlist_deny is on: vsftpd refuses "
+                                         "anonymous logins"));
         }
-        if (!deny && !anonymousListed && !ftpListed) {
+        if (!deny && !listed) {
             return denied(text(m_userlistFile), 0,
-                          QStringLiteral("neither anonymous nor ftp is listed in the userlist, and userlist_deny is "
-                                         "off: vsftpd refuses anonymous logins"));
+                          QStringLiteral("anonymous is not listed in the userlist and userlist_deny is off: vsftpd "
+                                         "refuses anonymous logins"));
         }
     }
     const QByteArray account = m_settings.value("ftp_username", "ftp");
@@ -302,11 +304,13 @@ UserForecast LoginForecast::forecastAnonymous()
     const QByteArray root = anonRoot ? m_settings.value("anon_root") : record.home;
     const QString what = anonRoot ? QStringLiteral("the anonymous root (anon_root)")
                                   : QStringLiteral("the anonymous root (home of %1)").arg(text(account));
-    if (auto problem = checkRoot(account, root, true, m_settings.isYes("allow_writeable_chroot", false), what)) {
-        if (anonRoot) {
-            problem->file = m_mainPath;
-            problem->line = m_settings.line("anon_root");
-        }
+    // The anonymous root is entered with root's rights, and allow_writeable_chroot
+    // does not apply to anonymous sessions.
+    if (auto problem = checkRoot(account, root, true, false, false, what)) {
+        problem->message.replace(QStringLiteral("unless allow_writeable_chroot=YES"),
+                                 QStringLiteral("(allow_writeable_chroot does not apply to anonymous sessions)"));
+        problem->file = anonRoot ? m_mainPath : QStringLiteral("/etc/passwd");
+        problem->line = anonRoot ? m_settings.line("anon_root") : 0;
         return UserForecast{ForecastStatus::Denied, {*problem}};
     }
     return UserForecast{ForecastStatus::Allowed, {}};
@@ -408,8 +412,8 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
     // The session starts in the home of its account; a local_root that
     // exists replaces it, one that does not is passed over.
     const QString homeWhat = QStringLiteral("the home directory of %1").arg(text(account));
-    if (auto problem = checkRoot(account, record.home, false, true, homeWhat))
-        return deny(problem->file, problem->line, problem->message);
+    if (auto problem = checkRoot(account, record.home, false, true, true, homeWhat))
+        return deny(QStringLiteral("/etc/passwd"), 0, problem->message);
     QByteArray root = record.home;
     QString rootWhat = homeWhat;
     if (const auto *localRoot = setting("local_root")) {
@@ -420,6 +424,12 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
         if (QFileInfo(m_config.root().resolve(text(directory))).isDir()) {
             root = directory;
             rootWhat = QStringLiteral("the local_root");
+        } else if (chrooted) {
+            // Confined, the session must change into it before the chroot.
+            return deny(own && own->find("local_root") ? ownPath : m_mainPath, localRoot->line,
+                        QStringLiteral("local_root %1 does not exist and the session is confined to it: vsftpd ends "
+                                       "the session (cannot change directory)")
+                            .arg(text(directory)));
         } else {
             result.findings.append({Severity::Info, m_mainPath, localRoot->line,
                                     QStringLiteral("local_root %1 does not exist: the session starts in %2")
@@ -427,8 +437,10 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
         }
     }
     if (chrooted) {
-        if (auto problem = checkRoot(account, root, true, yes("allow_writeable_chroot", false), rootWhat))
-            return deny(problem->file, problem->line, problem->message);
+        if (auto problem = checkRoot(account, root, true, yes("allow_writeable_chroot", false), true, rootWhat)) {
+            const bool fromPasswd = root == record.home;
+            return deny(fromPasswd ? QStringLiteral("/etc/passwd") : m_mainPath, 0, problem->message);
+        }
     }
     return result;
 }

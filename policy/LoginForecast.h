@@ -59,7 +59,7 @@ private:
     void checkServer();
     bool isListed(const QByteArray &login) const;
     std::optional<ForecastFinding> checkRoot(const QByteArray &account, const QByteArray &directory, bool chrooted,
-                                             bool allowWriteable, const QString &what) const;
+                                             bool allowWriteable, bool mustEnter, const QString &what) const;
     const VsftpdSettings *userSettings(const QByteArray &login);
 
     FtpServerConfig &m_config;

@@ -287,7 +287,9 @@ PamForecast::ModuleAnswer PamForecast::runListfile(const Line &line, const QByte
             return onError(QStringLiteral("the shell of %1 is unknown").arg(QString::fromUtf8(user)));
         candidates << account.shell;
     } else {
-        return {std::nullopt, QStringLiteral("item=%1 depends on the connection").arg(QString::fromUtf8(item))};
+        return {
+            std::nullopt,
+            QStringLiteral("pam_listfile with item=%1, which depends on the connection").arg(QString::fromUtf8(item))};
     }
     if (sense != "allow" && sense != "deny")
         return onError(QStringLiteral("sense=%1 is neither allow nor deny").arg(QString::fromUtf8(sense)));
@@ -394,18 +396,21 @@ PamForecast::ModuleAnswer PamForecast::run(const Line &line, const QByteArray &u
         return {Success, QString()};
     }
     if (line.module == "pam_nologin.so") {
-        for (const char *path : {"/etc/nologin", "/var/run/nologin", "/run/nologin"}) {
-            if (QFileInfo::exists(resolved(QString::fromLatin1(path)))) {
+        // file= names the one file to look for instead of the usual ones.
+        const QByteArray named = argument(line.args, "file");
+        const QList<QByteArray> files
+            = named.isEmpty() ? QList<QByteArray>{"/var/run/nologin", "/etc/nologin"} : QList<QByteArray>{named};
+        for (const QByteArray &path : files) {
+            if (QFileInfo::exists(resolved(QString::fromUtf8(path)))) {
                 AccountRecord account;
                 if (m_accounts.getUserInfo(user, account) && account.uid == 0)
                     return {Ignore, QString()};
-                return {AuthErr, QStringLiteral("%1 exists: only root may log in").arg(QLatin1String(path))};
+                return {AuthErr, QStringLiteral("%1 exists: only root may log in").arg(QString::fromUtf8(path))};
             }
         }
         return {Ignore, QString()};
     }
-    return {std::nullopt,
-            QStringLiteral("%1 is a module this forecast does not model").arg(QString::fromUtf8(line.module))};
+    return {std::nullopt, QStringLiteral("%1, which this forecast does not model").arg(QString::fromUtf8(line.module))};
 }
 
 PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const QByteArray &user)
@@ -433,7 +438,7 @@ PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const
                 if (yes.outcome == no.outcome)
                     return no.outcome == Outcome::Failure ? no : yes;
                 return {Outcome::Unknown, line.file, line.line,
-                        QStringLiteral("%1 decides, and its answer cannot be foreseen").arg(answer->reason)};
+                        QStringLiteral("the outcome depends on %1").arg(answer->reason)};
             }
             const QByteArray name = CodeNames[*code];
             QByteArray actionText = line.actions.value(name, line.actions.value("default", "bad"));

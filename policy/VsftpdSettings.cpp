@@ -183,21 +183,20 @@ VsftpdSettings::VsftpdSettings(const ConfigElementList &elements)
             break;
         case ElementType::Data: {
             const auto data = std::static_pointer_cast<ConfigElementData>(element);
-            // Nothing is trimmed: blanks before the key or around "=" become
-            // part of the key or the value.
-            const QByteArray key = blanks(data->x) + QByteArray::fromStdString(data->key) + blanks(data->gapBefore);
-            readLine(key, blanks(data->gapAfter) + QByteArray::fromStdString(data->value), line, true);
+            // Blanks before a setting are passed over; blanks around "=" are
+            // kept as part of the key or the value.
+            const QByteArray key = QByteArray::fromStdString(data->key) + blanks(data->gapBefore);
+            readLine(key, blanks(data->gapAfter) + QByteArray::fromStdString(data->value), line);
             break;
         }
         case ElementType::Expr: {
             const auto expr = std::static_pointer_cast<ConfigElementExpr>(element);
-            std::ostringstream text;
-            expr->print(text);
-            QByteArray whole = QByteArray::fromStdString(text.str());
-            whole.chop(1); // the line end
-            // Whatever comment lines the element carries were printed first.
-            whole = whole.mid(whole.lastIndexOf('\n') + 1);
-            readLine(whole, QByteArray(), line, false);
+            QByteArray words;
+            for (const auto &token : expr->tokens)
+                words += (words.isEmpty() ? "" : " ") + QByteArray::fromStdString(token.text);
+            m_errors.append(
+                {line,
+                 QStringLiteral("\"%1\" has no \"=\": vsftpd stops (missing value in config file)").arg(shown(words))});
             break;
         }
         default: {
@@ -213,7 +212,7 @@ VsftpdSettings::VsftpdSettings(const ConfigElementList &elements)
     }
 }
 
-void VsftpdSettings::readLine(const QByteArray &key, const QByteArray &value, int line, bool hasEquals)
+void VsftpdSettings::readLine(const QByteArray &key, const QByteArray &value, int line)
 {
     const Kind kind = kindOf(key);
     if (kind == Kind::Unknown) {
@@ -230,7 +229,6 @@ void VsftpdSettings::readLine(const QByteArray &key, const QByteArray &value, in
                              .arg(shown(key), shown(value))});
         return;
     }
-    Q_UNUSED(hasEquals);
     const auto it = m_settings.find(key);
     if (it != m_settings.end() && it->second.value != value) {
         m_repeats.append({line,

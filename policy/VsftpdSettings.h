@@ -9,9 +9,10 @@
 #include <map>
 
 // A configuration file read the way vsftpd 3.0.3 reads it: every line that
-// is not empty and does not begin with "#" is "key=value" with nothing
-// trimmed; an unknown key or a bad yes/no value stops the server; a repeated
-// key takes its last value.
+// is not empty and does not begin with "#" is "key=value", blanks before the
+// key passed over, blanks around "=" kept; a line without "=", an unknown
+// key or a bad yes/no value stops the server; a repeated key takes its last
+// value.
 class VsftpdSettings
 {
 public:
@@ -48,7 +49,7 @@ public:
     int line(const QByteArray &key) const;
 
 private:
-    void readLine(const QByteArray &key, const QByteArray &value, int line, bool hasEquals);
+    void readLine(const QByteArray &key, const QByteArray &value, int line);
 
     std::map<QByteArray, Setting> m_settings;
     QList<Problem> m_errors;

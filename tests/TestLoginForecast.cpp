@@ -195,12 +195,11 @@ void TestLoginForecast::configurationSyntax_data()
                                  << "2: unknown setting \"local_enabled\"";
     QTest::newRow("bad yes/no") << QByteArray("listen=YES\nlocal_enable=si\n") << true
                                 << "2: local_enable=\"si\" is not a yes/no value";
-    QTest::newRow("indented setting") << QByteArray("listen=YES\n  local_enable=YES\n") << true
-                                      << "2: unknown setting \"  local_enable\"";
+    QTest::newRow("indented setting is read") << QByteArray("listen=YES\n  local_enable=YES\n") << false << "";
     QTest::newRow("indented comment") << QByteArray("listen=YES\n  # note\nlocal_enable=YES\n") << true
                                       << "2: the comment is indented";
     QTest::newRow("line without =") << QByteArray("listen\nlocal_enable=YES\n") << true
-                                    << "1: listen=\"\" is not a yes/no value";
+                                    << "1: \"listen\" has no \"=\": vsftpd stops (missing value in config file)";
     QTest::newRow("carriage return") << QByteArray("listen=YES\r\nlocal_enable=YES\n") << true
                                      << "1: listen=\"YES\r\" is not a yes/no value";
     QTest::newRow("yes/no words in any case")
@@ -314,11 +313,15 @@ void TestLoginForecast::logins_data()
     QTest::newRow("white userlist must name anonymous too")
         << FileMap{{"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nuserlist_enable=YES\nuserlist_deny=NO\n"},
                    {"/etc/vsftpd.user_list", "bob\n"}}
-        << anon << denied << "/etc/vsftpd.user_list:0: neither anonymous nor ftp is listed";
+        << anon << denied << "/etc/vsftpd.user_list:0: anonymous is not listed in the userlist";
     QTest::newRow("white userlist naming anonymous")
         << FileMap{{"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nuserlist_enable=YES\nuserlist_deny=NO\n"},
                    {"/etc/vsftpd.user_list", "anonymous\n"}}
         << anon << allowed << "";
+    QTest::newRow("black userlist naming anonymous")
+        << FileMap{{"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nuserlist_enable=YES\n"},
+                   {"/etc/vsftpd.user_list", "anonymous\n"}}
+        << anon << denied << "/etc/vsftpd.user_list:0: anonymous is listed in the userlist";
     QTest::newRow("userlist from its key")
         << FileMap{{"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nuserlist_enable=YES\nuserlist_file=/etc/ul\n"},
                    {"/etc/ul", "alice\n"}}
@@ -421,14 +424,18 @@ void TestLoginForecast::pamStacks_data()
                                                 "account required pam_permit.so\n")
                                   << FileMap{{"/etc/nologin", "maintenance\n"}} << QByteArray("bob") << denied
                                   << "/etc/pam.d/vsftpd:1: PAM auth refuses: /etc/nologin exists";
+    QTest::newRow("nologin file named by file=")
+        << QByteArray("auth requisite pam_nologin.so file=/srv/closed\nauth required pam_permit.so\n"
+                      "account required pam_permit.so\n")
+        << FileMap{{"/srv/closed", "x"}} << QByteArray("bob") << denied
+        << "/etc/pam.d/vsftpd:1: PAM auth refuses: /srv/closed exists";
     QTest::newRow("no nologin file") << QByteArray("auth required pam_nologin.so\nauth required pam_permit.so\n"
                                                    "account required pam_permit.so\n")
                                      << FileMap{} << QByteArray("bob") << allowed << "";
     QTest::newRow("unknown module decides")
         << QByteArray("auth required pam_radius_auth.so\naccount required pam_permit.so\n") << FileMap{}
         << QByteArray("bob") << unknown
-        << "/etc/pam.d/vsftpd:1: pam_radius_auth.so is a module this forecast does "
-           "not model decides";
+        << "/etc/pam.d/vsftpd:1: the outcome depends on pam_radius_auth.so, which this forecast does not model";
     QTest::newRow("unknown module after a decision")
         << QByteArray("auth requisite pam_deny.so\nauth required pam_radius_auth.so\naccount required pam_permit.so\n")
         << FileMap{} << QByteArray("bob") << denied << "/etc/pam.d/vsftpd:1: PAM auth refuses: pam_deny";
@@ -480,14 +487,14 @@ void TestLoginForecast::homesAndChroot_data()
     const int denied = static_cast<int>(ForecastStatus::Denied);
     const QByteArray base = "listen=YES\nlocal_enable=YES\n";
 
-    QTest::newRow("home missing without chroot")
-        << base << "nohome" << QByteArray("bob") << denied << ":0: the home directory of bob /home/bob does not exist";
+    QTest::newRow("home missing without chroot") << base << "nohome" << QByteArray("bob") << denied
+                                                 << "/etc/passwd:0: the home directory of bob /home/bob does not exist";
     QTest::newRow("home not enterable") << base << "closed" << QByteArray("bob") << denied
-                                        << ":0: the home directory of bob /home/bob cannot be entered";
+                                        << "/etc/passwd:0: the home directory of bob /home/bob cannot be entered";
     QTest::newRow("chrooted into a writable home") << base + "chroot_local_user=YES\n"
                                                    << "" << QByteArray("bob") << denied
-                                                   << ":0: the home directory of bob "
-                                                      "/home/bob is writable";
+                                                   << "/etc/passwd:0: the home directory of bob /home/bob is "
+                                                      "writable";
     QTest::newRow("writable chroot allowed") << base + "chroot_local_user=YES\nallow_writeable_chroot=YES\n"
                                              << "" << QByteArray("bob") << allowed << "";
     QTest::newRow("writable chroot allowed by the per-user file")
@@ -504,18 +511,30 @@ void TestLoginForecast::homesAndChroot_data()
         << base + "local_root=/srv/none\n"
         << "" << QByteArray("bob") << allowed
         << "/etc/vsftpd.conf:3: local_root /srv/none does not exist: the session starts in /home/bob";
+    QTest::newRow("missing local_root of a confined user")
+        << base + "chroot_local_user=YES\nlocal_root=/srv/none\n"
+        << "readonly" << QByteArray("bob") << denied
+        << "/etc/vsftpd.conf:4: local_root /srv/none does not exist and the session is confined to it";
+    QTest::newRow("anonymous root writable even when allowed")
+        << base + "allow_writeable_chroot=YES\n"
+        << "ftpowned" << QByteArray("Anonymous users") << denied
+        << "/etc/passwd:0: the anonymous root (home of ftp) /srv/ftp is writable";
+    QTest::newRow("anonymous root closed to the account")
+        << base << "ftpclosed" << QByteArray("Anonymous users") << allowed << "";
     QTest::newRow("local_root with the user token")
         << base + "chroot_local_user=YES\nuser_sub_token=$USER\nlocal_root=/srv/$USER\n"
         << "userroot" << QByteArray("bob") << allowed << "";
-    QTest::newRow("anonymous root writable by ftp") << base << "ftpowned" << QByteArray("Anonymous users") << denied
-                                                    << ":0: the anonymous root (home of ftp) /srv/ftp is writable";
+    QTest::newRow("anonymous root writable by ftp")
+        << base << "ftpowned" << QByteArray("Anonymous users") << denied
+        << "/etc/passwd:0: the anonymous root (home of ftp) /srv/ftp is writable";
     QTest::newRow("anonymous root from anon_root") << base + "anon_root=/srv/none\n"
                                                    << "" << QByteArray("Anonymous users") << denied
                                                    << "/etc/vsftpd.conf:3: the anonymous root (anon_root) /srv/none "
                                                       "does not exist";
     QTest::newRow("guests chrooted into the guest home")
         << base + "guest_enable=YES\nguest_username=guest\n"
-        << "guestwritable" << QByteArray("bob") << denied << ":0: the home directory of guest /srv/guest is writable";
+        << "guestwritable" << QByteArray("bob") << denied
+        << "/etc/passwd:0: the home directory of guest /srv/guest is writable";
     QTest::newRow("virtual_use_local_privs: no chroot")
         << base + "guest_enable=YES\nguest_username=guest\nvirtual_use_local_privs=YES\n"
         << "" << QByteArray("bob") << allowed << "";
@@ -551,6 +570,8 @@ void TestLoginForecast::homesAndChroot()
     }
     if (setup == QLatin1String("guestwritable"))
         QCOMPARE(::chmod(path("/srv/guest").constData(), 0755), 0);
+    if (setup == QLatin1String("ftpclosed"))
+        QCOMPARE(::chmod(path("/srv/ftp").constData(), 0700), 0);
     if (setup == QLatin1String("ftpowned"))
         QCOMPARE(::chown(path("/srv/ftp").constData(), 107, 113), 0);
     const UserForecast forecast = f.forecast->forecast(user);

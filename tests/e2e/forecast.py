@@ -197,10 +197,9 @@ SCENARIOS: List[Scenario] = [
         ["anonymous_enable=YES", "  local_enable=YES"],
         accounts=users("e2ealice"),
         users={
-            "e2ealice": Login(ALLOWED, bug="indented-setting-accepted"),
-            ANONYMOUS: Login(ALLOWED, bug="indented-setting-accepted"),
+            "e2ealice": Login(ALLOWED),
+            ANONYMOUS: Login(ALLOWED),
         },
-        server_bug="indented-setting-accepted",
     ),
     Scenario(
         "conf-indented-comment",
@@ -333,14 +332,14 @@ SCENARIOS: List[Scenario] = [
         BOTH_ON + ["userlist_enable=YES", "userlist_file={tmp}/user_list"],
         accounts=users("e2ealice"),
         files={"{tmp}/user_list": ["anonymous"]},
-        users={"e2ealice": OK, ANONYMOUS: refused(USERLIST_NO, bug="userlist-anonymous-login-name")},
+        users={"e2ealice": OK, ANONYMOUS: refused(USERLIST_NO)},
     ),
     Scenario(
         "userlist-allow-names-ftp",
         BOTH_ON + ["userlist_enable=YES", "userlist_deny=NO", "userlist_file={tmp}/user_list"],
         accounts=users("e2ealice"),
         files={"{tmp}/user_list": ["e2ealice", "ftp"]},
-        users={"e2ealice": OK, ANONYMOUS: refused(USERLIST_NO, bug="userlist-anonymous-login-name")},
+        users={"e2ealice": OK, ANONYMOUS: refused(USERLIST_NO)},
     ),
     # --- PAM: which service, and anonymous logins ---------------------------------
     Scenario(
@@ -608,7 +607,7 @@ SCENARIOS: List[Scenario] = [
         pam=["auth requisite pam_nologin.so file={tmp}/ftp-closed"] + DEBIAN_PAM,
         accounts=users("e2ealice"),
         files={"{tmp}/ftp-closed": ["FTP is closed today."]},
-        users={"e2ealice": refused(PAM_NO, bug="nologin-file-argument"), ANONYMOUS: refused(PAM_NO)},
+        users={"e2ealice": refused(PAM_NO), ANONYMOUS: refused(PAM_NO)},
     ),
     Scenario(
         "pam-permit-account",
@@ -848,7 +847,7 @@ SCENARIOS: List[Scenario] = [
         # As the root of a chroot it must exist.
         LOCAL_ONLY + ["local_root={tmp}/no-such-root", "chroot_local_user=YES"],
         accounts=[Account("e2ealice", home="readonly")],
-        users={"e2ealice": refused(NO_DIR, bug="local-root-missing-chroot"), ANONYMOUS: refused(PAM_NO)},
+        users={"e2ealice": refused(NO_DIR), ANONYMOUS: refused(PAM_NO)},
     ),
     Scenario(
         "local-root-chroot",
@@ -872,7 +871,7 @@ SCENARIOS: List[Scenario] = [
         ["anonymous_enable=YES", "local_enable=NO", "allow_writeable_chroot=YES"],
         accounts=[dataclasses.replace(ANON, home="dir")],
         # allow_writeable_chroot does not cover anonymous sessions.
-        users={ANONYMOUS: refused(WRITABLE, bug="anonymous-writable-root-allowed")},
+        users={ANONYMOUS: refused(WRITABLE)},
     ),
     Scenario(
         "anonymous-root-closed",
@@ -881,7 +880,7 @@ SCENARIOS: List[Scenario] = [
         ["anonymous_enable=YES", "local_enable=NO"],
         accounts=[dataclasses.replace(ANON, home="closed")],
         # The login succeeds (230, PWD answers); listing will not.
-        users={ANONYMOUS: Login(ALLOWED, bug="anonymous-root-entered-as-root")},
+        users={ANONYMOUS: Login(ALLOWED)},
     ),
     Scenario(
         "anonymous-root-from-ftp-username",

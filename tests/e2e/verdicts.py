@@ -320,10 +320,7 @@ SCENARIOS: List[Scenario] = [
             "e2ebob": deny("userlist file contains e2ebob"),
             # The server looks up the login name "anonymous"; the verdict
             # looks up the row's label "Anonymous users", the program's rule.
-            ANONYMOUS: dataclasses.replace(
-                differs(ALLOWED, DENIED, "anonymous-userlist-by-label"),
-                forecast_bug="userlist-anonymous-login-name",
-            ),
+            ANONYMOUS: differs(ALLOWED, DENIED, "anonymous-userlist-by-label"),
         },
     ),
     Scenario(
@@ -484,7 +481,7 @@ SCENARIOS: List[Scenario] = [
         dirs=("{tmp}/ftp-alice",),
         users={
             "e2ealice": ALLOW,
-            "e2ebob": dataclasses.replace(deny("no-such-dir does not exist"), forecast_bug="local-root-missing-chroot"),
+            "e2ebob": deny("no-such-dir does not exist"),
             ANONYMOUS: deny("anonymous_enable option != yes"),
         },
     ),
