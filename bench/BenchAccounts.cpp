@@ -1,40 +1,19 @@
 // Loads 10,000 accounts and 100,000 virtual users from a generated root and
 // compares with the time db5.3_dump needs for the same database file.
 // Usage: benchaccounts [accounts] [virtual-users] [runs]
+#include "BenchSupport.h"
 #include "accounts/AccountStore.h"
 
 #include <QCoreApplication>
 #include <QDir>
 #include <QElapsedTimer>
 #include <QFile>
-#include <QProcess>
 #include <QTemporaryDir>
 
 #include <algorithm>
 #include <cstdio>
 
 namespace {
-
-bool writeFile(const QString &path, const QByteArray &content)
-{
-    QDir().mkpath(QFileInfo(path).absolutePath());
-    QFile file(path);
-    return file.open(QIODevice::WriteOnly) && file.write(content) == content.size();
-}
-
-double runMs(const QString &program, const QStringList &args, const QByteArray &input = {})
-{
-    QElapsedTimer timer;
-    timer.start();
-    QProcess process;
-    process.start(program, args);
-    process.write(input);
-    process.closeWriteChannel();
-    process.waitForFinished(600000);
-    if (process.exitCode() != 0)
-        std::fprintf(stderr, "%s failed: %s\n", qPrintable(program), process.readAllStandardError().constData());
-    return timer.nsecsElapsed() / 1e6;
-}
 
 } // namespace
 
@@ -47,7 +26,7 @@ int main(int argc, char **argv)
 
     QTemporaryDir dir;
     const QString root = dir.path();
-    QByteArray passwd, shadow, group, pairs;
+    QByteArray passwd, shadow, group;
     for (int i = 0; i < accounts; ++i) {
         const QByteArray n = QByteArray::number(i);
         passwd += "user" + n + ":x:" + QByteArray::number(10000 + i) + ":" + QByteArray::number(10000 + i % 1000)
@@ -57,14 +36,11 @@ int main(int argc, char **argv)
     for (int g = 0; g < 1000; ++g)
         group += "group" + QByteArray::number(g) + ":x:" + QByteArray::number(10000 + g) + ":user"
             + QByteArray::number(g) + ",user" + QByteArray::number(g + 1000) + "\n";
-    for (int i = 0; i < virtualUsers; ++i)
-        pairs += "virtual" + QByteArray::number(i) + "\npassword" + QByteArray::number(i) + "\n";
-    writeFile(root + "/etc/passwd", passwd);
-    writeFile(root + "/etc/shadow", shadow);
-    writeFile(root + "/etc/group", group);
-    QDir().mkpath(root + "/var/lib/ftpconfig");
+    writeBenchFile(root + "/etc/passwd", passwd);
+    writeBenchFile(root + "/etc/shadow", shadow);
+    writeBenchFile(root + "/etc/group", group);
     const QString dbFile = root + "/var/lib/ftpconfig/vsftpd_virtual_users.db";
-    const double loadMs = runMs("db5.3_load", {"-T", "-t", "hash", dbFile}, pairs);
+    const double loadMs = loadBenchDatabase(dbFile, virtualUserPairs(virtualUsers));
 
     double bestRw = 1e12, bestRo = 1e12, bestDump = 1e12;
     size_t loaded = 0;
@@ -82,7 +58,7 @@ int main(int argc, char **argv)
                                AccountStore::Access::ReadOnly);
             bestRo = std::min(bestRo, timer.nsecsElapsed() / 1e6);
         }
-        bestDump = std::min(bestDump, runMs("db5.3_dump", {"-p", "-f", "/dev/null", dbFile}));
+        bestDump = std::min(bestDump, runBenchProgram("db5.3_dump", {"-p", "-f", "/dev/null", dbFile}));
     }
     std::printf("accounts %d, virtual users %d, records loaded %zu, db file %lld bytes (db5.3_load %.0f ms)\n",
                 accounts, virtualUsers, loaded, static_cast<long long>(QFileInfo(dbFile).size()), loadMs);

@@ -1,6 +1,7 @@
 // Saves a root with 100,000 virtual users and 1,000 per-user files: with
 // nothing changed, with every per-user file changed, and with virtual users
 // added. Usage: benchsave [virtual-users] [per-user-files] [added-users]
+#include "BenchSupport.h"
 #include "policy/AccessReport.h"
 #include "policy/FtpServerConfig.h"
 
@@ -8,7 +9,6 @@
 #include <QDir>
 #include <QElapsedTimer>
 #include <QFile>
-#include <QProcess>
 #include <QStandardPaths>
 #include <QTemporaryDir>
 
@@ -17,14 +17,6 @@
 #include <sstream>
 
 namespace {
-
-void writeFile(const QString &path, const QByteArray &content)
-{
-    QDir().mkpath(QFileInfo(path).absolutePath());
-    QFile file(path);
-    if (!file.open(QIODevice::WriteOnly) || file.write(content) != content.size())
-        std::fprintf(stderr, "cannot write %s\n", qPrintable(path));
-}
 
 double ms(const QElapsedTimer &timer)
 {
@@ -46,27 +38,19 @@ int main(int argc, char **argv)
     QByteArray passwd = "root:x:0:0::/root:/bin/sh\nftp:x:107:113::/srv/ftp:/usr/sbin/nologin\n";
     for (int i = 0; i < perUserFiles; ++i) {
         passwd += "user" + QByteArray::number(i) + ":x:" + QByteArray::number(10000 + i) + ":1000::/home/u:/bin/sh\n";
-        writeFile(root + "/etc/vsftpd.d/users.d/user" + QString::number(i),
-                  "# per-user settings\nlocal_root=/srv/user" + QByteArray::number(i) + "\ndownload_enable=YES\n");
+        writeBenchFile(root + "/etc/vsftpd.d/users.d/user" + QString::number(i),
+                       "# per-user settings\nlocal_root=/srv/user" + QByteArray::number(i) + "\ndownload_enable=YES\n");
     }
-    writeFile(root + "/etc/passwd", passwd);
-    writeFile(root + "/etc/shadow", "");
-    writeFile(root + "/etc/group", "users:x:1000:\n");
-    writeFile(root + "/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nguest_enable=YES\nuserlist_enable=YES\n");
-    writeFile(root + "/etc/vsftpd.d/allowed_user_list.conf", "");
-    writeFile(root + "/etc/vsftpd.chroot_list", "");
-    writeFile(root + "/etc/pam.d/vsftpd",
-              "auth sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
-              "account sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n");
-    QByteArray pairs;
-    for (int i = 0; i < virtualUsers; ++i)
-        pairs += "virtual" + QByteArray::number(i) + "\npassword" + QByteArray::number(i) + "\n";
-    QDir().mkpath(root + "/var/lib/ftpconfig");
-    QProcess load;
-    load.start("db5.3_load", {"-T", "-t", "hash", root + "/var/lib/ftpconfig/users.db"});
-    load.write(pairs);
-    load.closeWriteChannel();
-    load.waitForFinished(600000);
+    writeBenchFile(root + "/etc/passwd", passwd);
+    writeBenchFile(root + "/etc/shadow", "");
+    writeBenchFile(root + "/etc/group", "users:x:1000:\n");
+    writeBenchFile(root + "/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nguest_enable=YES\nuserlist_enable=YES\n");
+    writeBenchFile(root + "/etc/vsftpd.d/allowed_user_list.conf", "");
+    writeBenchFile(root + "/etc/vsftpd.chroot_list", "");
+    writeBenchFile(root + "/etc/pam.d/vsftpd",
+                   "auth sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
+                   "account sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n");
+    loadBenchDatabase(root + "/var/lib/ftpconfig/users.db", virtualUserPairs(virtualUsers));
 
     std::ostringstream quiet;
     std::streambuf *out = std::cout.rdbuf(quiet.rdbuf());

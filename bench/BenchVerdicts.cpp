@@ -1,6 +1,7 @@
 // Loads a generated root and evaluates every user of the table, at the
 // given size and at twice that size, to show that the cost grows linearly.
 // Usage: benchverdicts [accounts] [virtual-users] [userlist-names] [runs]
+#include "BenchSupport.h"
 #include "policy/AccessReport.h"
 #include "policy/FtpServerConfig.h"
 #include "policy/LoginForecast.h"
@@ -9,7 +10,6 @@
 #include <QDir>
 #include <QElapsedTimer>
 #include <QFile>
-#include <QProcess>
 #include <QStandardPaths>
 #include <QTemporaryDir>
 
@@ -38,14 +38,6 @@ struct Figures
     int forecastAllowed = 0;
 };
 
-void writeFile(const QString &path, const QByteArray &content)
-{
-    QDir().mkpath(QFileInfo(path).absolutePath());
-    QFile file(path);
-    if (!file.open(QIODevice::WriteOnly) || file.write(content) != content.size())
-        std::fprintf(stderr, "cannot write %s\n", qPrintable(path));
-}
-
 void generate(const QString &root, const Sizes &sizes)
 {
     QByteArray passwd = "root:x:0:0::/root:/bin/sh\nftp:x:107:113::/srv/ftp:/usr/sbin/nologin\n"
@@ -61,31 +53,23 @@ void generate(const QString &root, const Sizes &sizes)
     QByteArray userlist;
     for (int i = 0; i < sizes.userlist; ++i)
         userlist += "user" + QByteArray::number(i * 3) + "\n";
-    QByteArray pairs;
-    for (int i = 0; i < sizes.virtualUsers; ++i)
-        pairs += "virtual" + QByteArray::number(i) + "\npassword" + QByteArray::number(i) + "\n";
 
-    writeFile(root + "/etc/passwd", passwd);
-    writeFile(root + "/etc/shadow", shadow);
-    writeFile(root + "/etc/group", group);
-    writeFile(root + "/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nguest_enable=YES\n");
-    writeFile(root + "/etc/pam.d/vsftpd",
-              "auth sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
-              "account sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
-              "auth required pam_listfile.so item=user sense=deny file=/etc/ftpusers\n"
-              "@include common-auth\n");
-    writeFile(root + "/etc/ftpusers", "root\nuser7\n");
-    writeFile(root + "/etc/vsftpd.d/allowed_user_list.conf", userlist);
+    writeBenchFile(root + "/etc/passwd", passwd);
+    writeBenchFile(root + "/etc/shadow", shadow);
+    writeBenchFile(root + "/etc/group", group);
+    writeBenchFile(root + "/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nguest_enable=YES\n");
+    writeBenchFile(root + "/etc/pam.d/vsftpd",
+                   "auth sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
+                   "account sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
+                   "auth required pam_listfile.so item=user sense=deny file=/etc/ftpusers\n"
+                   "@include common-auth\n");
+    writeBenchFile(root + "/etc/ftpusers", "root\nuser7\n");
+    writeBenchFile(root + "/etc/vsftpd.d/allowed_user_list.conf", userlist);
     QDir().mkpath(root + "/srv/ftp");
     QDir().mkpath(root + "/var/run/vsftpd/empty");
-    writeFile(root + "/etc/shells", "/bin/sh\n/bin/bash\n");
+    writeBenchFile(root + "/etc/shells", "/bin/sh\n/bin/bash\n");
     QDir().mkpath(root + "/etc/vsftpd.d/users.d");
-    QDir().mkpath(root + "/var/lib/ftpconfig");
-    QProcess load;
-    load.start("db5.3_load", {"-T", "-t", "hash", root + "/var/lib/ftpconfig/users.db"});
-    load.write(pairs);
-    load.closeWriteChannel();
-    load.waitForFinished(600000);
+    loadBenchDatabase(root + "/var/lib/ftpconfig/users.db", virtualUserPairs(sizes.virtualUsers));
 }
 
 double ms(const QElapsedTimer &timer)
