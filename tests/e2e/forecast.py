@@ -17,42 +17,40 @@ Where the program itself ends before judging anything (a missing PAM service
 file is one of its own start rules), only the server's side is checked. The
 text table must show the same forecast as the JSON.
 
-It shares the harness of verdicts.py (accounts, the private /etc, the
-server's settings) and, like it, runs only inside
+It shares harness.py with verdicts.py (accounts, the private /etc, the
+server's settings, the server, the logins) and, like it, runs only inside
 scripts/with-private-etc.sh.
 """
 
-import argparse
 import dataclasses
-import ftplib
 import json
 import os
-import shutil
-import socket
-import subprocess
 import sys
-import tempfile
-import time
 from typing import Dict, List, Optional, Tuple
 
 # Run from the source tree: no compiled copy of the harness left beside it.
 sys.dont_write_bytecode = True
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-import verdicts as harness  # noqa: E402  (the shared harness lives next to this file)
-from verdicts import ALLOWED, ANONYMOUS, ANONYMOUS_ROW, DENIED, Account, SetupError  # noqa: E402
+import harness  # noqa: E402  (the shared harness lives next to this file)
+from harness import (  # noqa: E402
+    ALLOWED,
+    ANONYMOUS,
+    ANONYMOUS_ROW,
+    CONF,
+    DEBIAN_PAM,
+    DENIED,
+    VDB,
+    VUSERS,
+    Account,
+    SetupError,
+    debian_pam,
+    userdb_pam,
+)
 
 UNKNOWN = "unknown"
 SEVERITIES = ("error", "warning", "info")
-RUN_DEADLINE = 300
-CONF = "/etc/vsftpd.conf"
 # The column of the text table that shows the forecast.
 TABLE_COLUMN = "SERVER"
-
-# More forms of a home or root directory than verdicts.py needs:
-# "closed": owned by root, 0700, so that the account cannot enter it;
-# "world": owned by root, 0777, writable by every account.
-harness.HOME_FORMS.setdefault("closed", (0o700, False, False))
-harness.HOME_FORMS.setdefault("world", (0o777, False, False))
 
 
 @dataclasses.dataclass(frozen=True)
@@ -91,19 +89,9 @@ WRITABLE = "writable root inside chroot()"
 
 
 @dataclasses.dataclass(frozen=True)
-class Scenario:
-    """A scenario; the fields up to `omit` mean what they mean in verdicts.py."""
-
-    name: str
-    conf: List[str]
+class Scenario(harness.Setup):
+    # user -> what the server does with the right password
     users: Dict[str, Login]
-    accounts: List[Account] = dataclasses.field(default_factory=list)
-    pam: Optional[List[str]] = None
-    pam_service: str = "vsftpd"
-    dbs: Dict[str, Dict[str, str]] = dataclasses.field(default_factory=dict)
-    files: Dict[str, List[str]] = dataclasses.field(default_factory=dict)
-    dirs: Tuple[str, ...] = ()
-    omit: Tuple[str, ...] = ()
     # Fields of /etc/shadow set after the accounts are made: user ->
     # {field index: value} (2: last change, 4: maximum age, 7: expiry).
     shadow: Dict[str, Dict[int, str]] = dataclasses.field(default_factory=dict)
@@ -121,15 +109,10 @@ class Scenario:
     report_refuses: str = ""
 
 
-debian_pam = harness.debian_pam
-DEBIAN_PAM = harness.DEBIAN_PAM
 COMMON = ["@include common-account", "@include common-session", "@include common-auth"]
 DENY_ALL = ["auth requisite pam_deny.so", "account requisite pam_deny.so"]
-userdb_pam = harness.userdb_pam
 ANON = harness.ANON_ACCOUNT
 GUEST = harness.GUEST_ACCOUNT
-VDB = harness.VDB
-VUSERS = harness.VUSERS
 BOTH_ON = ["anonymous_enable=YES", "local_enable=YES"]
 LOCAL_ONLY = ["anonymous_enable=NO", "local_enable=YES"]
 GUEST_ON = ["local_enable=YES", "guest_enable=YES", "guest_username=e2eguest"]
@@ -937,81 +920,12 @@ def set_shadow_fields(changes: Dict[str, Dict[int, str]]) -> None:
         target.writelines(lines)
 
 
-# The server ---------------------------------------------------------------------
-
-
-class Server(harness.Vsftpd):
-    """vsftpd that may be expected not to start."""
-
-    def start(self) -> bool:  # type: ignore[override]
-        """True once it answers on the port; False when it exited instead."""
-        # vsftpd writes why it stops to descriptor 0, where a connection
-        # would be under inetd: give it the log, opened for writing.
-        with open(self.log_path, "w+b") as log:
-            self.process = subprocess.Popen(
-                [harness.VSFTPD, CONF],
-                stdin=log,
-                stdout=log,
-                stderr=subprocess.STDOUT,
-                preexec_fn=harness.die_with_parent,
-            )
-        deadline = time.monotonic() + harness.START_TIMEOUT
-        while time.monotonic() < deadline:
-            if self.process.poll() is not None:
-                return False
-            try:
-                # Any greeting will do: a "500 OOPS" one is a verdict too.
-                with socket.create_connection(("127.0.0.1", self.port), timeout=1) as probe:
-                    probe.settimeout(harness.FTP_TIMEOUT)
-                    probe.recv(200)
-                return True
-            except OSError:
-                time.sleep(0.05)
-        raise SetupError(f"vsftpd neither answered on 127.0.0.1:{self.port} nor exited within {harness.START_TIMEOUT}s")
-
-
-def try_login(port: int, user: str, password: str) -> Tuple[str, str]:
-    """ALLOWED when the server says 230 and answers PWD; a greeting of
-    "500 OOPS" or a closed connection is a refusal."""
-    ftp = ftplib.FTP(timeout=harness.FTP_TIMEOUT)
-    try:
-        try:
-            ftp.connect("127.0.0.1", port, timeout=harness.FTP_TIMEOUT)
-            reply = ftp.login(user, password)
-            ftp.pwd()
-        except ftplib.error_perm as error:
-            return DENIED, str(error)
-        except (EOFError, ConnectionResetError, BrokenPipeError) as error:
-            return DENIED, f"connection closed: {error!r}"
-        except (OSError, ftplib.error_temp, ftplib.error_proto, ftplib.error_reply) as error:
-            raise SetupError(f"login of {user}: {error!r}") from error
-        try:
-            ftp.quit()
-        except (OSError, EOFError, ftplib.Error):
-            pass
-        return ALLOWED, reply
-    finally:
-        ftp.close()
-
-
 # The report ---------------------------------------------------------------------
 
 
 def run_report(report: str, tmp: str, *form: str) -> Tuple[Optional[str], str]:
     """What the program printed, or None and what it said when it failed."""
-    env = dict(os.environ)
-    # Settings of an operator's own session must not change the answers.
-    env["XDG_CONFIG_HOME"] = os.path.join(tmp, "xdg")
-    try:
-        done = subprocess.run(
-            [report, "--root", "/", *form],
-            capture_output=True,
-            text=True,
-            timeout=harness.REPORT_TIMEOUT,
-            env=env,
-        )
-    except (OSError, subprocess.TimeoutExpired) as error:
-        raise SetupError(f"ftpconfig-report: {error}") from error
+    done = harness.run_report(report, tmp, *form)
     if done.returncode != 0:
         return None, f"exit status {done.returncode}: {(done.stdout + done.stderr).strip()}"
     return done.stdout, ""
@@ -1093,11 +1007,11 @@ def log_in_everybody(scenario: Scenario, port: int) -> Tuple[Dict[str, Tuple[str
     problems: List[str] = []
     for user, login in scenario.users.items():
         name, password = harness.credentials(scenario, user)
-        results[user] = try_login(port, name, password)
+        results[user] = harness.try_login(port, name, password, greeting_may_refuse=True)
         if results[user][0] != ALLOWED or user == ANONYMOUS:
             continue
         # A server that admits anybody would agree with anything.
-        wrong, reply = try_login(port, name, password + "x")
+        wrong, reply = harness.try_login(port, name, password + "x", greeting_may_refuse=True)
         if login.any_password and wrong != ALLOWED:
             problems.append(f"{user}: the server refused a password that nullok should let through")
         if not login.any_password and wrong != DENIED:
@@ -1222,7 +1136,7 @@ def run_scenario(scenario: Scenario, report: str, tmp: str) -> Tuple[bool, int]:
     """(passed, logins with a known forecast fault)."""
     etc = EtcSnapshot()
     port = harness.free_port()
-    server = Server(port, os.path.join(tmp, "vsftpd.log"))
+    server = harness.Vsftpd(port, os.path.join(tmp, "vsftpd.log"), may_fail=True)
     problems: List[str] = []
     try:
         harness.prepare(scenario, tmp, port, etc)
@@ -1281,15 +1195,8 @@ def run_scenario(scenario: Scenario, report: str, tmp: str) -> Tuple[bool, int]:
 
 
 def check_table() -> None:
-    base_keys = {harness.key_of(line) for line in harness.BASE_CONF}
-    names = set()
+    harness.check_names_and_keys(SCENARIOS)
     for scenario in SCENARIOS:
-        if scenario.name in names:
-            raise SystemExit(f"scenario {scenario.name} appears twice")
-        names.add(scenario.name)
-        clash = base_keys & {harness.key_of(line) for line in scenario.conf} - set(scenario.omit)
-        if clash:
-            raise SystemExit(f"scenario {scenario.name} sets keys of the base configuration: {sorted(clash)}")
         if scenario.fails not in ("", "start", "connect"):
             raise SystemExit(f"scenario {scenario.name}: unknown kind of failure {scenario.fails!r}")
         if scenario.blame and scenario.blame not in scenario.conf:
@@ -1309,56 +1216,26 @@ def check_table() -> None:
 
 
 def main() -> int:
-    parser = argparse.ArgumentParser(description=__doc__.splitlines()[0])
-    parser.add_argument("--report", required=True, help="the ftpconfig-report program")
-    parser.add_argument("--scenario", action="append", help="run only this scenario (repeatable)")
-    args = parser.parse_args()
+    bugs = 0
 
-    private, why = harness.etc_is_private()
-    if not private:
-        print(
-            f"forecast.py: refusing to run: {why}. It writes to /etc; run it through "
-            "scripts/with-private-etc.sh, which gives it a private copy of /etc.",
-            file=sys.stderr,
-        )
-        return 2
-    if os.geteuid() != 0:
-        print("forecast.py: must run as root (it adds accounts and starts vsftpd)", file=sys.stderr)
-        return 2
-    for tool in (harness.VSFTPD, harness.DB_LOAD, harness.CHPASSWD):
-        if shutil.which(tool) is None:
-            print(f"forecast.py: {tool} is not installed", file=sys.stderr)
-            return 2
-    if not os.access(args.report, os.X_OK):
-        print(f"forecast.py: {args.report} is not an executable program", file=sys.stderr)
-        return 2
-    check_table()
-    harness.become_subreaper()
-    scenarios = [s for s in SCENARIOS if not args.scenario or s.name in args.scenario]
-    if not scenarios:
-        print("forecast.py: no scenario selected", file=sys.stderr)
-        return 2
+    def run_one(scenario: Scenario, report: str, tmp: str) -> bool:
+        nonlocal bugs
+        ok, seen = run_scenario(scenario, report, tmp)
+        bugs += seen
+        return ok
 
-    passed = failed = bugs = 0
-    deadline = time.monotonic() + RUN_DEADLINE
-    for scenario in scenarios:
-        if time.monotonic() > deadline:
-            print(f"{scenario.name}: ERROR not run, the run took longer than {RUN_DEADLINE}s")
-            failed += 1
-            continue
-        tmp = tempfile.mkdtemp(prefix="ftpconfig-e2e-")
-        try:
-            os.chmod(tmp, 0o755)
-            ok, seen = run_scenario(scenario, args.report, tmp)
-            bugs += seen
-            if ok:
-                passed += 1
-            else:
-                failed += 1
-        finally:
-            shutil.rmtree(tmp, ignore_errors=True)
-    print(f"{passed} passed, {failed} failed; {bugs} logins with a known forecast bug (FORECAST-BUG)")
-    return 0 if failed == 0 else 1
+    return harness.main(
+        script="forecast.py",
+        doc=__doc__,
+        option="--report",
+        program_help="the ftpconfig-report program",
+        tools=(harness.VSFTPD, harness.DB_LOAD, harness.CHPASSWD),
+        table=SCENARIOS,
+        check_table=check_table,
+        prefix="ftpconfig-e2e-",
+        run_one=run_one,
+        summary=lambda: f"; {bugs} logins with a known forecast bug (FORECAST-BUG)",
+    )
 
 
 if __name__ == "__main__":

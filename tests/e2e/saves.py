@@ -16,12 +16,11 @@ Where the engine is known to miss its promise, the scenario names the checks
 that fail and why ("known engine fault"): the suite passes while those fail
 exactly, and fails once they pass, so that the mark goes with the fault.
 
-It shares the harness of verdicts.py (accounts, the server's settings, the
-login) and, like it, runs only inside scripts/with-private-etc.sh: it writes
-to /etc.
+It shares harness.py with verdicts.py and forecast.py (accounts, the
+server's settings, the server, the login) and, like them, runs only inside
+scripts/with-private-etc.sh: it writes to /etc.
 """
 
-import argparse
 import dataclasses
 import ftplib
 import io
@@ -32,20 +31,16 @@ import socket
 import stat
 import subprocess
 import sys
-import tempfile
-import time
 from typing import Dict, FrozenSet, List, Optional, Tuple
 
 # Run from the source tree: no compiled copy of the harness left beside it.
 sys.dont_write_bytecode = True
 sys.path.insert(0, os.path.dirname(os.path.abspath(__file__)))
-import verdicts as harness  # noqa: E402  (the shared harness lives next to this file)
-from verdicts import ALLOWED, DENIED, Account, SetupError  # noqa: E402
+import harness  # noqa: E402  (the shared harness lives next to this file)
+from harness import ALLOWED, DENIED, Account, SetupError  # noqa: E402
 
-# Seconds: one edit (the engine opens a Berkeley DB environment), and the
-# whole run (ctest kills the test at 600).
+# Seconds: one edit (the engine opens a Berkeley DB environment).
 EDIT_TIMEOUT = 60
-RUN_DEADLINE = 300
 
 # What an upload attempt came to.
 STORED = "stored"
@@ -106,9 +101,7 @@ class Listing:
 
 
 @dataclasses.dataclass(frozen=True)
-class Scenario:
-    name: str
-    conf: List[str]
+class Scenario(harness.Setup):
     # ("grant", USER), ("deny", USER), ("rights", USER, "write, download"),
     # ("directory", USER, PATH); {tmp} is filled in.
     edit: Tuple[str, ...]
@@ -118,12 +111,6 @@ class Scenario:
     # path -> what the edit does to it (CONTENT, MODE, CREATED, ...); every
     # other path under /etc and {tmp} must stay as it was, byte for byte
     changes: Dict[str, str]
-    accounts: List[Account] = dataclasses.field(default_factory=list)
-    pam: Optional[List[str]] = None  # default: Debian's
-    # path -> lines; root-owned 0644, under /etc or {tmp}
-    files: Dict[str, List[str]] = dataclasses.field(default_factory=dict)
-    # directories under {tmp}, root-owned 0755
-    dirs: Tuple[str, ...] = ()
     # path -> the lines the edit must leave in it, each ended by "\n"
     saved_text: Dict[str, List[str]] = dataclasses.field(default_factory=dict)
     uploads: Tuple[Upload, ...] = ()
@@ -482,19 +469,22 @@ def differences(before: Dict[str, Entry], after: Dict[str, Entry]) -> Dict[str, 
     return changed
 
 
-class EtcGuard:
+class EtcGuard(harness.EtcSnapshot):
     """Puts /etc back exactly as it was when the guard was made: the files a
-    scenario writes, and whatever the edit made or changed."""
+    scenario writes (harness.prepare writes them through the guard), and
+    whatever the edit made or changed anywhere below /etc."""
 
     def __init__(self) -> None:
-        self.saved = capture(["/etc"])
+        super().__init__()
+        self.tree = capture(["/etc"])
 
     def restore(self) -> None:
+        super().restore()
         now = capture(["/etc"])
-        for path in sorted(now.keys() - self.saved.keys(), reverse=True):
+        for path in sorted(now.keys() - self.tree.keys(), reverse=True):
             remove(path)
-        for path in sorted(self.saved):
-            old, new = self.saved[path], now.get(path)
+        for path in sorted(self.tree):
+            old, new = self.tree[path], now.get(path)
             if old.kind == "other":
                 continue
             if new is not None and new.kind != old.kind:
@@ -520,37 +510,6 @@ def remove(path: str) -> None:
         shutil.rmtree(path)
     elif os.path.lexists(path):
         os.unlink(path)
-
-
-# Setting a scenario up ---------------------------------------------------------
-
-
-def prepare(scenario: Scenario, tmp: str, port: int) -> None:
-    for directory in ("empty", "anon"):
-        os.makedirs(os.path.join(tmp, directory), 0o755, exist_ok=True)
-    harness.add_accounts(scenario, tmp)  # uses scenario.accounts only
-    write(tmp, "/etc/vsftpd.conf", [harness.fill(line, tmp, port) for line in harness.BASE_CONF + scenario.conf])
-    for path, lines in harness.COMMON_PAM.items():
-        write(tmp, path, lines)
-    write(tmp, "/etc/pam.d/vsftpd", scenario.pam if scenario.pam is not None else harness.DEBIAN_PAM)
-    for path in scenario.dirs:
-        path = harness.fill(path, tmp)
-        if not path.startswith(tmp + "/"):
-            raise SetupError(f"{path} is not under the temporary directory")
-        os.makedirs(path, 0o755, exist_ok=True)
-    for path, lines in scenario.files.items():
-        write(tmp, path, lines)
-
-
-def write(tmp: str, path: str, lines: List[str]) -> None:
-    path = harness.fill(path, tmp)
-    if not (path.startswith("/etc/") or path.startswith(tmp + "/")):
-        raise SetupError(f"{path} is neither under /etc nor under the temporary directory")
-    os.makedirs(os.path.dirname(path), 0o755, exist_ok=True)
-    with open(path, "w", encoding="utf-8") as target:
-        target.writelines(harness.fill(line, tmp) + "\n" for line in lines)
-    os.chmod(path, 0o644)
-    os.chown(path, 0, 0)
 
 
 # The edit ------------------------------------------------------------------
@@ -594,29 +553,8 @@ def run_edit(program: str, edit: Tuple[str, ...], run_dir: str) -> Tuple[bool, s
 
 def session(port: int, user: str) -> Tuple[Optional[ftplib.FTP], str]:
     """A logged-in session, or None and the server's refusal."""
-    ftp = ftplib.FTP(timeout=harness.FTP_TIMEOUT)
-    try:
-        ftp.connect("127.0.0.1", port, timeout=harness.FTP_TIMEOUT)
-    except OSError as error:
-        ftp.close()
-        raise SetupError(f"cannot connect to 127.0.0.1:{port}: {error}") from error
-    try:
-        ftp.login(user, harness.password_of(user))
-    except (ftplib.error_perm, EOFError, ConnectionError) as error:
-        ftp.close()
-        return None, f"login refused: {error}"
-    except (socket.timeout, ftplib.Error) as error:
-        ftp.close()
-        raise SetupError(f"login of {user}: {error!r}") from error
-    return ftp, ""
-
-
-def close(ftp: ftplib.FTP) -> None:
-    try:
-        ftp.quit()
-    except (OSError, EOFError, ftplib.Error):
-        pass
-    ftp.close()
+    ftp, reply = harness.log_in(port, user, harness.password_of(user))
+    return ftp, ("" if ftp is not None else f"login refused: {reply}")
 
 
 def try_upload(port: int, user: str) -> Tuple[str, str, bytes]:
@@ -638,7 +576,7 @@ def try_upload(port: int, user: str) -> Tuple[str, str, bytes]:
     except (ftplib.Error, EOFError, OSError) as error:
         raise SetupError(f"upload of {user}: {error!r}") from error
     finally:
-        close(ftp)
+        harness.close(ftp)
 
 
 def first_listing(port: int, user: str) -> Tuple[Optional[List[str]], str]:
@@ -652,7 +590,7 @@ def first_listing(port: int, user: str) -> Tuple[Optional[List[str]], str]:
     except (ftplib.Error, EOFError, OSError) as error:
         raise SetupError(f"listing of {user}: {error!r}") from error
     finally:
-        close(ftp)
+        harness.close(ftp)
 
 
 def greeting(port: int) -> str:
@@ -764,7 +702,7 @@ def run_scenario(scenario: Scenario, program: str, base: str) -> bool:
     edit = tuple(harness.fill(part, tmp) for part in scenario.edit)
     edit_output = ""
     try:
-        prepare(scenario, tmp, port)
+        harness.prepare(scenario, tmp, port, guard)
         server.start()
         try:
             check_server("before", scenario, tmp, port, checks)
@@ -829,16 +767,10 @@ def describe(failed: Dict[str, str], tmp: str) -> str:
 
 def check_table() -> None:
     """Catches slips in the table itself before anything runs."""
-    base_keys = {harness.key_of(line) for line in harness.BASE_CONF}
-    names = set()
+    harness.check_names_and_keys(SCENARIOS)
     for scenario in SCENARIOS:
         where = f"scenario {scenario.name}"
-        if scenario.name in names:
-            raise SystemExit(f"{where} appears twice")
-        names.add(scenario.name)
         conf = {harness.key_of(line): line.split("=", 1)[1] for line in scenario.conf}
-        if base_keys & conf.keys():
-            raise SystemExit(f"{where} sets keys of the base configuration")
         if scenario.edit[0] not in ("grant", "deny", "rights", "directory"):
             raise SystemExit(f"{where}: unknown edit {scenario.edit[0]}")
         # The engine checks the rights against the user's root and offers
@@ -861,55 +793,17 @@ def check_table() -> None:
 
 
 def main() -> int:
-    parser = argparse.ArgumentParser(description=__doc__.splitlines()[0])
-    parser.add_argument("--edit", required=True, help="the editchild program")
-    parser.add_argument("--scenario", action="append", help="run only this scenario (repeatable)")
-    args = parser.parse_args()
-
-    private, why = harness.etc_is_private()
-    if not private:
-        print(
-            f"saves.py: refusing to run: {why}. It writes to /etc; run it through "
-            "scripts/with-private-etc.sh, which gives it a private copy of /etc.",
-            file=sys.stderr,
-        )
-        return 2
-    if os.geteuid() != 0:
-        print("saves.py: must run as root (it adds accounts and starts vsftpd)", file=sys.stderr)
-        return 2
-    for tool in (harness.VSFTPD, harness.CHPASSWD, "unshare", "mount"):
-        if shutil.which(tool) is None:
-            print(f"saves.py: {tool} is not installed", file=sys.stderr)
-            return 2
-    if not os.access(args.edit, os.X_OK):
-        print(f"saves.py: {args.edit} is not an executable program", file=sys.stderr)
-        return 2
-    check_table()
-    harness.become_subreaper()
-    scenarios = [s for s in SCENARIOS if not args.scenario or s.name in args.scenario]
-    if not scenarios:
-        print("saves.py: no scenario selected", file=sys.stderr)
-        return 2
-
-    passed = failed = 0
-    deadline = time.monotonic() + RUN_DEADLINE
-    for scenario in scenarios:
-        if time.monotonic() > deadline:
-            print(f"{scenario.name}: ERROR not run, the run took longer than {RUN_DEADLINE}s")
-            failed += 1
-            continue
-        base = tempfile.mkdtemp(prefix="ftpconfig-saves-")
-        try:
-            # Accounts must reach their homes below it.
-            os.chmod(base, 0o755)
-            if run_scenario(scenario, args.edit, base):
-                passed += 1
-            else:
-                failed += 1
-        finally:
-            shutil.rmtree(base, ignore_errors=True)
-    print(f"{passed} passed, {failed} failed")
-    return 0 if failed == 0 else 1
+    return harness.main(
+        script="saves.py",
+        doc=__doc__,
+        option="--edit",
+        program_help="the editchild program",
+        tools=(harness.VSFTPD, harness.CHPASSWD, "unshare", "mount"),
+        table=SCENARIOS,
+        check_table=check_table,
+        prefix="ftpconfig-saves-",
+        run_one=run_scenario,
+    )
 
 
 if __name__ == "__main__":
