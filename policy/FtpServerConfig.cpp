@@ -722,7 +722,6 @@ bool FtpServerConfig::fixPamUserdb()
 
 void FtpServerConfig::blockUserByUserlist(const QByteArray &user)
 {
-    userlistMode(); // taken before anything changes, as the inversion below needs
     setValue(m_main.elements, "", "userlist_enable", "yes");
     const QByteArray path = value("userlist_file", DefaultListDirectory + "allowed_user_list.conf");
     if (value("userlist_deny", "yes").toLower() != "yes") {
