@@ -161,7 +161,7 @@ QStringList FtpServerConfig::readNameList(const QByteArray &path) const
 
 void FtpServerConfig::loadUserlist()
 {
-    m_userlistPath = value("userlist_file", DefaultListDirectory + "allowed_user_list.conf");
+    m_userlistPath = configuredUserlistPath();
     m_userlist = NameList(readNameList(m_userlistPath));
     m_loadedText[text(m_userlistPath)] = nameListContent(m_userlist, m_userlistPath).toStdString();
 }
@@ -187,7 +187,7 @@ void FtpServerConfig::loadFtpusers()
 
 void FtpServerConfig::loadChrootList()
 {
-    m_chrootListPath = value("chroot_list_file", "/etc/vsftpd.chroot_list");
+    m_chrootListPath = configuredChrootListPath();
     m_chrootList = NameList(readNameList(m_chrootListPath));
     m_loadedText[text(m_chrootListPath)] = nameListContent(m_chrootList, m_chrootListPath).toStdString();
 }
@@ -236,6 +236,17 @@ void FtpServerConfig::loadVirtualUsers()
 }
 
 // Settings -----------------------------------------------------------------
+
+QByteArray FtpServerConfig::configuredUserlistPath() const
+{
+    // Deliberately the program's own file, not the server's default.
+    return value("userlist_file", DefaultListDirectory + "allowed_user_list.conf");
+}
+
+QByteArray FtpServerConfig::configuredChrootListPath() const
+{
+    return value("chroot_list_file", "/etc/vsftpd.chroot_list");
+}
 
 QByteArray FtpServerConfig::value(const QByteArray &key, const QByteArray &defaultValue) const
 {
@@ -723,7 +734,7 @@ bool FtpServerConfig::fixPamUserdb()
 void FtpServerConfig::blockUserByUserlist(const QByteArray &user)
 {
     setValue(m_main.elements, "", "userlist_enable", "yes");
-    const QByteArray path = value("userlist_file", DefaultListDirectory + "allowed_user_list.conf");
+    const QByteArray path = configuredUserlistPath();
     if (value("userlist_deny", "yes").toLower() != "yes") {
         Interaction::Question question;
         question.message

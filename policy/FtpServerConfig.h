@@ -104,6 +104,11 @@ public:
     // nothing failed. Files whose content did not change are not touched.
     bool save();
 
+    // The list files as the main configuration names them now, or the
+    // program's defaults.
+    QByteArray configuredUserlistPath() const;
+    QByteArray configuredChrootListPath() const;
+
     // Main configuration value of a key, or the default when absent.
     QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;
     // Lower-cased value compared with "yes"; absent gives the default.

@@ -133,7 +133,7 @@ bool FtpServerConfig::save()
     }
 
     // 2. Userlist, always enabled afterwards.
-    m_userlistPath = value("userlist_file", "/etc/vsftpd.d/allowed_user_list.conf");
+    m_userlistPath = configuredUserlistPath();
     ok = saveNameList(m_userlistPath, m_userlist) && ok;
     setValue(m_main.elements, "", "userlist_enable", "yes");
     // The server's own default is another file (/etc/vsftpd.user_list): an
@@ -144,7 +144,7 @@ bool FtpServerConfig::save()
     m_userlistModified = false;
 
     // 3. Chroot list.
-    m_chrootListPath = value("chroot_list_file", "/etc/vsftpd.chroot_list");
+    m_chrootListPath = configuredChrootListPath();
     ok = saveNameList(m_chrootListPath, m_chrootList) && ok;
     m_chrootListModified = false;
 

@@ -150,8 +150,9 @@ void LoginForecast::checkServer()
                       .arg(text(m_userlistFile)));
         }
     }
+    m_chrootListFile = m_settings.value("chroot_list_file", "/etc/vsftpd.chroot_list");
     if (m_settings.isYes("chroot_list_enable", false))
-        m_chrootList = readLines(root.resolve(text(m_settings.value("chroot_list_file", "/etc/vsftpd.chroot_list"))));
+        m_chrootList = readLines(root.resolve(text(m_chrootListFile)));
 
     // The PAM service the server uses: the last pam_service_name, which is
     // the one the engine loaded unless the key is repeated.
@@ -396,7 +397,7 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
                 return deny(m_mainPath, m_settings.line("chroot_list_enable"),
                             QStringLiteral("chroot_list_enable is on, but the chroot list %1 cannot be read: vsftpd "
                                            "ends every local login")
-                                .arg(text(m_settings.value("chroot_list_file", "/etc/vsftpd.chroot_list"))));
+                                .arg(text(m_chrootListFile)));
             }
             bool listed = false;
             for (QByteArray line : *m_chrootList) {

@@ -70,6 +70,7 @@ private:
     bool m_serverFails = false;
     QByteArray m_userlistFile;
     std::optional<QList<QByteArray>> m_userlist;
+    QByteArray m_chrootListFile;
     std::optional<QList<QByteArray>> m_chrootList;
     std::unique_ptr<ConfigFile> m_ownPam; // when the server's service is another
     std::unique_ptr<PamForecast> m_pam;
