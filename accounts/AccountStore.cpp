@@ -1,6 +1,6 @@
 #include "AccountStore.h"
 
-#include "policy/AppStrings.h"
+#include "common/AppStrings.h"
 
 #include <QFile>
 

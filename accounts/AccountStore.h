@@ -1,7 +1,7 @@
 #pragma once
 
 #include "VirtualUserDb.h"
-#include "policy/RootDirectory.h"
+#include "common/RootDirectory.h"
 
 #include <QByteArray>
 #include <QList>

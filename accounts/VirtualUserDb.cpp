@@ -1,6 +1,6 @@
 #include "VirtualUserDb.h"
 
-#include "policy/AppStrings.h"
+#include "common/AppStrings.h"
 
 #include <QCoreApplication>
 #include <QDateTime>

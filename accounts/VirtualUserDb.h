@@ -1,6 +1,6 @@
 #pragma once
 
-#include "policy/RootDirectory.h"
+#include "common/RootDirectory.h"
 
 #include <QByteArray>
 

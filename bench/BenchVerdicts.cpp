@@ -2,9 +2,9 @@
 // given size and at twice that size, to show that the cost grows linearly.
 // Usage: benchverdicts [accounts] [virtual-users] [userlist-names] [runs]
 #include "BenchSupport.h"
-#include "policy/AccessReport.h"
+#include "report/AccessReport.h"
 #include "policy/FtpServerConfig.h"
-#include "policy/LoginForecast.h"
+#include "forecast/LoginForecast.h"
 
 #include <QCoreApplication>
 #include <QDir>

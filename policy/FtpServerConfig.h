@@ -1,13 +1,14 @@
 #pragma once
 
 #include "accounts/AccountStore.h"
+#include "common/RootDirectory.h"
 #include "config/ConfigFile.h"
 #include "policy/AccessFailure.h"
 #include "policy/Interaction.h"
 #include "policy/NameList.h"
-#include "policy/RootDirectory.h"
 
 #include <QByteArray>
+#include <QCoreApplication>
 #include <QSet>
 #include <QString>
 #include <QStringList>
@@ -22,6 +23,8 @@
 // and only a save writes it back.
 class FtpServerConfig
 {
+    Q_DECLARE_TR_FUNCTIONS(FtpServerConfig)
+
 public:
     // ReadOnly creates and changes nothing under the root: a missing main
     // configuration reads as "listen=YES", no directory, environment or
@@ -98,6 +101,8 @@ public:
     // Compares the rights with the permission bits of the user's root and
     // offers to fix the bits; changes the directory at once.
     void checkFolderPermissions(const QByteArray &user, const QStringList &rights);
+    // The same for a directory that is about to become the user's root.
+    void checkFolderPermissions(const QByteArray &user, const QStringList &rights, const QByteArray &directory);
 
     // Writes back everything loaded and changed, store by store; a failure
     // is reported and the next store is written all the same. True when
@@ -165,6 +170,10 @@ private:
     QByteArray nameListContent(const NameList &names, const QByteArray &path) const;
     bool saveNameList(const QByteArray &path, const NameList &names);
     bool saveUserConfigs();
+    // Through the atomic writer, trusting links only root could have made
+    // under the root directory.
+    std::optional<QString> writeFile(const QString &file, const QByteArray &content);
+    void reportUnsaved(const QString &shown, const QString &reason);
     ConfigFile *rightsTarget(const QByteArray &user);
     void setYes(const QByteArray &key);
 

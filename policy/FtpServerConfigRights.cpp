@@ -1,8 +1,9 @@
-// Rights, per-user files, roots and folder permissions of FtpServerConfig.
+// Rights, per-user files and roots of FtpServerConfig.
 #include "FtpServerConfig.h"
+#include "FtpServerConfigInternal.h"
 
-#include "policy/AppStrings.h"
-#include "policy/SafeFile.h"
+#include "common/AppStrings.h"
+#include "common/SafeFile.h"
 
 #include <QCoreApplication>
 #include <QDir>
@@ -13,16 +14,6 @@
 #include <sys/stat.h>
 
 namespace {
-
-QString tr(const char *text)
-{
-    return QCoreApplication::translate("FtpServerConfig", text);
-}
-
-QString text(const QByteArray &bytes)
-{
-    return QString::fromUtf8(bytes);
-}
 
 const char CreatedComment[] = "# File was created by FTP manager\n";
 
@@ -114,8 +105,7 @@ bool FtpServerConfig::createUserConfig(const QByteArray &user)
     }
     const QString file = resolved(path);
     QDir().mkpath(QFileInfo(file).absolutePath());
-    const QString error = writeFileAtomically(file, CreatedComment);
-    if (!error.isEmpty()) {
+    if (writeFile(file, CreatedComment)) {
         std::cerr << "Unable to open " << path.constData() << std::endl;
         m_interaction.critical(QString(), tr("Unable to create per-user config file."));
         std::cout << "File " << path.constData() << " is not created." << std::endl;
@@ -201,84 +191,4 @@ void FtpServerConfig::setChrooted(const QByteArray &user)
         m_chrootList.append(name);
     }
     m_chrootListModified = m_modified = true;
-}
-
-void FtpServerConfig::checkFolderPermissions(const QByteArray &user, const QStringList &rights)
-{
-    const AppStrings &strings = AppStrings::instance();
-    const QByteArray directory = effectiveRoot(user);
-    // A user who is not confined has "/" as its root: the session starts in
-    // its home and the bits of "/" are not the user's business. Opening "/"
-    // to everybody would be.
-    if (directory == "/")
-        return;
-    const QString shown = text(directory);
-    const QByteArray onDisk = QFile::encodeName(resolved(directory));
-    struct stat info
-    {
-    };
-    if (::stat(onDisk.constData(), &info) != 0)
-        return;
-
-    const QByteArray account = ftpAccountName(user);
-    AccountRecord record;
-    if (!m_accounts || !m_accounts->getUserInfo(account, record)) {
-        m_interaction.critical(
-            QString(), tr("Unable to get groups in which user participates in. Username: %1").arg(text(account)));
-        return;
-    }
-    QByteArray ownerName;
-    for (const auto &entry : m_accounts->accounts()) {
-        if (entry.second.uid == info.st_uid) {
-            ownerName = entry.first;
-            break;
-        }
-    }
-    QByteArray groupName;
-    const auto group = m_accounts->groups().find(info.st_gid);
-    if (group != m_accounts->groups().end())
-        groupName = group->second.name;
-    if (ownerName.isEmpty())
-        ownerName = QByteArray::number(info.st_uid);
-    if (groupName.isEmpty())
-        groupName = QByteArray::number(info.st_gid);
-
-    // The permission class the session's account falls in.
-    int shift = 0;
-    if (info.st_uid == record.uid)
-        shift = 6;
-    else if (m_accounts->isUserInGroup(account, groupName))
-        shift = 3;
-    const mode_t readBit = S_IROTH << shift;
-    const mode_t writeBit = S_IWOTH << shift;
-
-    const bool full = rights.contains(strings.fullAccess) || rights.contains(QStringLiteral("full access"));
-    const auto has = [&](const QString &translated, const char *word) {
-        return full || rights.contains(translated) || rights.contains(QLatin1String(word));
-    };
-    const QString mapped
-        = account != user ? tr("Detected mapped system user: %1").arg(text(account)) + QLatin1Char('\n') : QString();
-    mode_t mode = info.st_mode & 07777;
-    const auto askFix = [&](const QString &question, mode_t bit) {
-        Interaction::Question box;
-        box.message = {Interaction::Icon::Question, QString(), question.arg(text(account)), tr("Let me fix it?"),
-                       mapped + tr("Folder owner: %1\nFolder group: %2\n").arg(text(ownerName), text(groupName))
-                           + QLatin1Char('\n') + tr("Current permissions:\n") + permissionLetters(mode)
-                           + QLatin1Char('\n') + tr("New permissions:\n") + permissionLetters(mode | bit)};
-        box.buttons = {Interaction::Button::Yes, Interaction::Button::No};
-        if (m_interaction.ask(box) == Interaction::Button::Yes)
-            mode |= bit;
-    };
-
-    if (has(strings.download, "download") && !(mode & readBit))
-        askFix(tr("User may download, but folder has no READ permission for user %1"), readBit);
-    const bool writes = has(strings.write, "write") || has(strings.upload, "upload") || has(strings.mkdir, "mkdir");
-    if (writes && !(mode & writeBit)) {
-        if (isAnonymousUser(user))
-            m_interaction.warn(QString(), tr("Root folder for anonymous user must be read-only by him."));
-        else if (!isYes("guest_enable"))
-            askFix(tr("User may write, but folder has no WRITE permission for user %1"), writeBit);
-    }
-    if (mode != (info.st_mode & 07777) && ::chmod(onDisk.constData(), mode) != 0)
-        m_interaction.critical(QString(), tr("Unable to change permissions of folder %1").arg(shown));
 }

@@ -1,8 +1,9 @@
 // Saving of FtpServerConfig: every store written back through one writer.
 #include "FtpServerConfig.h"
+#include "FtpServerConfigInternal.h"
 
-#include "policy/AppStrings.h"
-#include "policy/SafeFile.h"
+#include "common/AppStrings.h"
+#include "common/SafeFile.h"
 
 #include <QCoreApplication>
 #include <QDir>
@@ -10,26 +11,6 @@
 #include <QFileInfo>
 
 #include <iostream>
-
-namespace {
-
-QString tr(const char *text)
-{
-    return QCoreApplication::translate("FtpServerConfig", text);
-}
-
-QString text(const QByteArray &bytes)
-{
-    return QString::fromUtf8(bytes);
-}
-
-QString directoryOf(const QString &path)
-{
-    const int slash = path.lastIndexOf(QLatin1Char('/'));
-    return slash <= 0 ? QStringLiteral("/") : path.left(slash);
-}
-
-} // namespace
 
 void FtpServerConfig::remember(const QString &key, const ConfigFile &document)
 {
@@ -40,6 +21,16 @@ bool FtpServerConfig::unchanged(const QString &key, const std::string &printed) 
 {
     const auto it = m_loadedText.find(key);
     return it != m_loadedText.end() && it->second == printed;
+}
+
+std::optional<QString> FtpServerConfig::writeFile(const QString &file, const QByteArray &content)
+{
+    return writeFileAtomically(file, content, 0644, m_root.isSystemRoot() ? QStringLiteral("/") : m_root.path());
+}
+
+void FtpServerConfig::reportUnsaved(const QString &shown, const QString &reason)
+{
+    m_interaction.show({Interaction::Icon::Critical, QString(), tr("Unable to save %1").arg(shown), QString(), reason});
 }
 
 QByteArray FtpServerConfig::nameListContent(const NameList &names, const QByteArray &path) const
@@ -70,8 +61,8 @@ bool FtpServerConfig::saveNameList(const QByteArray &path, const NameList &names
     if (!QDir().mkpath(directory)) {
         m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(directoryOf(shown)));
     }
-    if (!writeFileAtomically(file, content).isEmpty()) {
-        m_interaction.critical(QString(), tr("Unable to save %1").arg(shown));
+    if (const auto error = writeFile(file, content)) {
+        reportUnsaved(shown, *error);
         return false;
     }
     m_loadedText[shown] = content.toStdString();
@@ -92,23 +83,23 @@ bool FtpServerConfig::saveUserConfigs()
         const std::string printed = document->text();
         if (unchanged(shown, printed))
             continue;
+        // The program has always ended these files with an empty line; one
+        // that has it already (read back from an earlier save) gets no
+        // second, or every save would grow the file by a line.
+        const bool endsEmpty = printed.size() >= 2 && printed.compare(printed.size() - 2, 2, "\n\n") == 0;
+        const QByteArray content = QByteArray::fromStdString(printed) + (endsEmpty ? "" : "\n");
         if (const auto reason = invalidNameReason(user)) {
             m_interaction.critical(QString(),
                                    tr("Unable to save %1").arg(shown) + QLatin1Char('\n')
                                        + tr("\"%1\" cannot be a file name: %2.").arg(text(user), *reason));
             continue;
         }
-        // Printed followed by a line end, as the program always wrote them.
-        if (!writeFileAtomically(resolved(m_userConfigDir + user), QByteArray::fromStdString(printed) + '\n')
-                 .isEmpty()) {
-            m_interaction.critical(QString(), tr("Unable to save %1").arg(shown));
+        if (const auto error = writeFile(resolved(m_userConfigDir + user), content)) {
+            reportUnsaved(shown, *error);
             ok = false;
             continue;
         }
-        m_loadedText[shown] = printed + '\n';
-        // The file now ends with an empty line the document does not hold:
-        // read it back so that the next save compares like with like.
-        document->parseText(m_loadedText[shown]);
+        remember(shown, *document);
     }
     return ok;
 }
@@ -159,10 +150,11 @@ bool FtpServerConfig::save()
                                   "neccesary for virtual users mechanism. Create it and re-run ftp config"));
         ok = false;
     } else if (!unchanged(pamPath, m_pam.text())) {
-        if (!writeFileAtomically(resolved(QFile::encodeName(pamPath)), QByteArray::fromStdString(m_pam.text()))
-                 .isEmpty()) {
+        if (const auto error
+            = writeFile(resolved(QFile::encodeName(pamPath)), QByteArray::fromStdString(m_pam.text()))) {
             std::cout << "File " << QFile::encodeName(pamPath).constData() << " could not be created or opened"
                       << std::endl;
+            reportUnsaved(pamPath, *error);
             ok = false;
         } else {
             remember(pamPath, m_pam);
@@ -176,10 +168,11 @@ bool FtpServerConfig::save()
         if (!QFileInfo(resolved(m_ftpusersRule->file)).isFile()) {
             std::cout << "File " << m_ftpusersRule->file.constData() << " not found" << std::endl;
         } else if (!unchanged(listPath, m_ftpusers.text())) {
-            if (!writeFileAtomically(resolved(m_ftpusersRule->file), QByteArray::fromStdString(m_ftpusers.text()))
-                     .isEmpty()) {
+            if (const auto error
+                = writeFile(resolved(m_ftpusersRule->file), QByteArray::fromStdString(m_ftpusers.text()))) {
                 std::cout << "Ftpusers file (" << m_ftpusersRule->file.constData() << ") could not be open"
                           << std::endl;
+                reportUnsaved(listPath, *error);
                 ok = false;
             } else {
                 remember(listPath, m_ftpusers);
@@ -191,8 +184,8 @@ bool FtpServerConfig::save()
     // 7. Main configuration.
     const QString mainPath = AppStrings::instance().mainConfigPath;
     if (!unchanged(mainPath, m_main.text())) {
-        if (!writeFileAtomically(m_root.resolve(mainPath), QByteArray::fromStdString(m_main.text())).isEmpty()) {
-            m_interaction.critical(QString(), tr("Unable to save %1").arg(mainPath));
+        if (const auto error = writeFile(m_root.resolve(mainPath), QByteArray::fromStdString(m_main.text()))) {
+            reportUnsaved(mainPath, *error);
             ok = false;
         } else {
             remember(mainPath, m_main);

@@ -10,18 +10,15 @@ cd "$(dirname "$0")/.."
 seconds=${1:-60}
 update=${2:-}
 out=build-fuzz
-mkdir -p "$out"
-clang++ -std=c++17 -O1 -g -fsanitize=fuzzer,address,undefined -fno-sanitize-recover=all -I. -Itests/support \
-    config/ConfigElement.cpp config/ConfigFile.cpp tests/support/RoundTrip.cpp tests/fuzz/FuzzConfigParser.cpp \
-    -o "$out/fuzzconfig"
+scripts/build.sh "$out" -DCMAKE_CXX_COMPILER=clang++ -DWITH_FUZZER=ON -DCMAKE_BUILD_TYPE=RelWithDebInfo
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
 cp tests/data/config-corpus/* "$work/"
-"$out/fuzzconfig" -max_total_time="$seconds" -max_len=4096 -timeout=10 -rss_limit_mb=2048 \
+"$out/tests/fuzz/fuzzconfig" -max_total_time="$seconds" -max_len=4096 -timeout=10 -rss_limit_mb=2048 \
     -artifact_prefix="$out/" "$work" 2>&1 | tail -n 5
 if [ "$update" = "--update-corpus" ]; then
     fresh=$(mktemp -d)
-    "$out/fuzzconfig" -merge=1 "$fresh" tests/data/config-corpus "$work" 2>&1 | tail -n 1
+    "$out/tests/fuzz/fuzzconfig" -merge=1 "$fresh" tests/data/config-corpus "$work" 2>&1 | tail -n 1
     # Keep the committed corpus small: at most 16 new inputs, the smallest.
     ls -S -r "$fresh" | head -n 16 | while read -r f; do cp -n "$fresh/$f" tests/data/config-corpus/; done
     rm -rf "$fresh"

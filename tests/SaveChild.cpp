@@ -1,7 +1,7 @@
 // Loads a root, changes a little of everything and saves it: the process
 // the crash test kills in the middle of its save. Prints "SAVING" just
 // before the save begins and "SAVED" once it is done.
-#include "policy/AccessReport.h"
+#include "report/AccessReport.h"
 #include "policy/FtpServerConfig.h"
 
 #include <QCoreApplication>

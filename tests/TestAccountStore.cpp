@@ -1,3 +1,4 @@
+#include "TestMain.h"
 #include "CaptureStream.h"
 #include "TemporaryRoot.h"
 #include "accounts/AccountStore.h"
@@ -187,5 +188,5 @@ void TestAccountStore::names()
     QVERIFY(!sameName(QStringLiteral("bob "), QByteArray("bob")));
 }
 
-QTEST_GUILESS_MAIN(TestAccountStore)
+FTPCONFIG_TEST_GUILESS_MAIN(TestAccountStore)
 #include "TestAccountStore.moc"

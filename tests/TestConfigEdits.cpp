@@ -1,3 +1,4 @@
+#include "TestMain.h"
 #include "config/ConfigFile.h"
 
 #include <QtTest>
@@ -244,5 +245,5 @@ void TestConfigEdits::commentsTravelWithTheirLine()
     QVERIFY(line.hasToken("a"));
 }
 
-QTEST_GUILESS_MAIN(TestConfigEdits)
+FTPCONFIG_TEST_GUILESS_MAIN(TestConfigEdits)
 #include "TestConfigEdits.moc"

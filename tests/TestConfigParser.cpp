@@ -1,3 +1,4 @@
+#include "TestMain.h"
 #include "RoundTrip.h"
 #include "config/ConfigFile.h"
 
@@ -335,5 +336,5 @@ void TestConfigParser::bracketControlsAreTokenLines()
     QCOMPARE(std::next(line->tokens.begin())->text, std::string("[success=1"));
 }
 
-QTEST_GUILESS_MAIN(TestConfigParser)
+FTPCONFIG_TEST_GUILESS_MAIN(TestConfigParser)
 #include "TestConfigParser.moc"

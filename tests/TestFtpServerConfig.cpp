@@ -1,3 +1,4 @@
+#include "TestMain.h"
 #include "CaptureStream.h"
 #include "FixtureRoot.h"
 #include "ScriptedInteraction.h"
@@ -745,5 +746,5 @@ void TestFtpServerConfig::failureDialog()
     QCOMPARE(interaction.records.first().message.icon, Interaction::Icon::Critical);
 }
 
-QTEST_GUILESS_MAIN(TestFtpServerConfig)
+FTPCONFIG_TEST_GUILESS_MAIN(TestFtpServerConfig)
 #include "TestFtpServerConfig.moc"

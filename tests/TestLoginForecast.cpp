@@ -1,8 +1,9 @@
+#include "TestMain.h"
 #include "CaptureStream.h"
 #include "FixtureRoot.h"
 #include "ScriptedInteraction.h"
 #include "policy/FtpServerConfig.h"
-#include "policy/LoginForecast.h"
+#include "forecast/LoginForecast.h"
 
 #include <QStandardPaths>
 #include <QtTest>
@@ -588,5 +589,5 @@ void TestLoginForecast::missingMainConfiguration()
              QStringLiteral("/etc/vsftpd.conf:0: the file does not exist: vsftpd does not start"));
 }
 
-QTEST_GUILESS_MAIN(TestLoginForecast)
+FTPCONFIG_TEST_GUILESS_MAIN(TestLoginForecast)
 #include "TestLoginForecast.moc"

@@ -1,6 +1,7 @@
 // Real PAM reads what the store writes: pam_userdb, driven by pamtester,
 // authenticates the virtual users against the database file we saved. Runs
 // only inside scripts/with-private-etc.sh, which gives it a private /etc.
+#include "TestMain.h"
 #include "Process.h"
 #include "TemporaryRoot.h"
 #include "accounts/AccountStore.h"
@@ -124,5 +125,5 @@ void TestPamUserdb::pamReadsTheStore()
     QVERIFY(reloaded.isVirtualUser("ben"));
 }
 
-QTEST_GUILESS_MAIN(TestPamUserdb)
+FTPCONFIG_TEST_GUILESS_MAIN(TestPamUserdb)
 #include "TestPamUserdb.moc"

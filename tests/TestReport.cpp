@@ -1,5 +1,6 @@
 #include "FixtureRoot.h"
 #include "Process.h"
+#include "TestMain.h"
 
 #include <QCryptographicHash>
 #include <QDirIterator>
@@ -15,7 +16,7 @@ Q_DECLARE_METATYPE(FileMap)
 
 namespace {
 
-const QString Report = QStringLiteral(FTPCONFIG_BINARY_DIR "/ftpconfig-report");
+const QString Report = QStringLiteral(FTPCONFIG_REPORT);
 
 ProcessResult report(const QStringList &arguments)
 {
@@ -120,7 +121,9 @@ void TestReport::badRoots()
     QVERIFY(result.finished);
     QCOMPARE(result.exitCode, status);
     QCOMPARE(result.out, QByteArray());
-    const QByteArray line = "ftpconfig-report: " + error.arg(rootPath).toUtf8() + '\n';
+    if (error.contains(QLatin1String("%1")))
+        error = error.arg(rootPath);
+    const QByteArray line = "ftpconfig-report: " + error.toUtf8() + '\n';
     QVERIFY2(result.err.endsWith(line), result.err.constData());
 }
 
@@ -293,5 +296,5 @@ void TestReport::hostileFiles()
         QVERIFY(result.err.contains("ftpconfig-report: "));
 }
 
-QTEST_GUILESS_MAIN(TestReport)
+FTPCONFIG_TEST_GUILESS_MAIN(TestReport)
 #include "TestReport.moc"

@@ -1,3 +1,4 @@
+#include "TestMain.h"
 #include "CaptureStream.h"
 #include "FixtureRoot.h"
 #include "ScriptedInteraction.h"
@@ -446,5 +447,5 @@ void TestRights::createRootDirectory()
     QCOMPARE(failure.message, QStringLiteral("***Result: FALSE. Check: Unable to create directory /srv/file/sub."));
 }
 
-QTEST_GUILESS_MAIN(TestRights)
+FTPCONFIG_TEST_GUILESS_MAIN(TestRights)
 #include "TestRights.moc"

@@ -1,8 +1,9 @@
 #include "CaptureStream.h"
 #include "FixtureRoot.h"
 #include "ScriptedInteraction.h"
+#include "TestMain.h"
+#include "common/SafeFile.h"
 #include "policy/FtpServerConfig.h"
-#include "policy/SafeFile.h"
 
 #include <QDirIterator>
 #include <QStandardPaths>
@@ -107,7 +108,8 @@ private slots:
     void failures_data();
     void failures();
     void writerKeepsModeAndOwner();
-    void writerReplacesSymlinks();
+    void writerFollowsOnlyRootsLinks_data();
+    void writerFollowsOnlyRootsLinks();
     void writerRefusesDirectories();
     void hiddenFilesAreNoUsers();
     void serverReadsTheProgramsUserlist();
@@ -195,10 +197,12 @@ void TestSave::perUserFilesEndWithAnEmptyLine()
     // them so; indentation is normalised to tabs.
     const QByteArray first = "# bob\n\t\tlocal_root=/srv/elsewhere\nwrite_enable=YES\n\n";
     QCOMPARE(engine.root.readFile("/etc/vsftpd.d/users.d/bob"), first);
+    // Read back, the empty line is the document's own: it gets no second.
+    QVERIFY(engine.reload());
     QVERIFY(engine.config->setUserRoot("bob", "/srv/third"));
     QVERIFY(engine.config->save());
     QCOMPARE(engine.root.readFile("/etc/vsftpd.d/users.d/bob"),
-             QByteArray("# bob\n\t\tlocal_root=/srv/third\nwrite_enable=YES\n\n\n"));
+             QByteArray("# bob\n\t\tlocal_root=/srv/third\nwrite_enable=YES\n\n"));
 }
 
 void TestSave::failures_data()
@@ -215,12 +219,12 @@ void TestSave::failures_data()
     QTest::newRow("userlist directory impossible")
         << "userlist"
         << QStringList{"|Unable to create path /etc/blocked/sub. Server may not start.",
-                       "|Unable to save /etc/blocked/sub/list"}
+                       "|Unable to save /etc/blocked/sub/list||cannot create a temporary file: Not a directory"}
         << "/etc/vsftpd.chroot_list";
     QTest::newRow("per-user directory impossible")
         << "userdir"
         << QStringList{"|Unable to create path /etc/vsftpd.d/users.d/. Server may not start.",
-                       "|Unable to save /etc/vsftpd.d/users.d/bob"}
+                       "|Unable to save /etc/vsftpd.d/users.d/bob||cannot create a temporary file: Not a directory"}
         << "/etc/vsftpd.conf";
 }
 
@@ -262,7 +266,7 @@ void TestSave::writerKeepsModeAndOwner()
     QVERIFY(root.writeFile("/etc/private.conf", "old\n", 0640));
     const QString path = root.filePath("/etc/private.conf");
     QCOMPARE(::chown(QFile::encodeName(path).constData(), 1000, 1001), 0);
-    QCOMPARE(writeFileAtomically(path, "new\n"), QString());
+    QVERIFY(!writeFileAtomically(path, "new\n"));
     const struct stat info = statOf(path);
     QCOMPARE(info.st_mode & 07777, 0640u);
     QCOMPARE(info.st_uid, 1000u);
@@ -271,37 +275,70 @@ void TestSave::writerKeepsModeAndOwner()
     // No temporary file is left behind, nor one an interrupted write left.
     QVERIFY(root.writeFile("/etc/.private.conf.ftpconfig-a1B2c3", "torn"));
     QVERIFY(root.writeFile("/etc/.other.ftpconfig-a1B2c3", "not ours to remove"));
-    QCOMPARE(writeFileAtomically(path, "newer\n"), QString());
+    QVERIFY(!writeFileAtomically(path, "newer\n"));
     QCOMPARE(QDir(root.filePath("/etc")).entryList(QDir::Files | QDir::Hidden),
              (QStringList{".other.ftpconfig-a1B2c3", "private.conf"}));
     // A new file gets the mode asked for.
-    QCOMPARE(writeFileAtomically(root.filePath("/etc/fresh"), "x", 0600), QString());
+    QVERIFY(!writeFileAtomically(root.filePath("/etc/fresh"), "x", 0600));
     QCOMPARE(statOf(root.filePath("/etc/fresh")).st_mode & 07777, 0600u);
 }
 
-void TestSave::writerReplacesSymlinks()
+void TestSave::writerFollowsOnlyRootsLinks_data()
 {
+    QTest::addColumn<QString>("plant");
+    QTest::addColumn<bool>("kept");
+    // Administrators link the configuration from a repository: root's link
+    // in root's directories is kept and its target written.
+    QTest::newRow("root's link") << "" << true;
+    QTest::newRow("link of another user") << "chown-link" << false;
+    QTest::newRow("link in a directory others may write") << "open-dir" << false;
+    QTest::newRow("target in a directory others may write") << "open-target-dir" << false;
+}
+
+void TestSave::writerFollowsOnlyRootsLinks()
+{
+    QFETCH(QString, plant);
+    QFETCH(bool, kept);
     Engine engine;
     QVERIFY(engine.load(richFiles()));
-    // Someone plants a link where the userlist goes, pointing at a file
-    // that must never be written.
-    QVERIFY(engine.root.writeFile("/etc/shadow-copy", "precious\n", 0600));
-    const QString list = engine.root.filePath("/etc/vsftpd.d/allowed_user_list.conf");
-    QVERIFY(QFile::remove(list));
-    QVERIFY(QFile::link(engine.root.filePath("/etc/shadow-copy"), list));
-    engine.config->userlist().append("dora");
-    QVERIFY(engine.config->save());
-    QCOMPARE(engine.root.readFile("/etc/shadow-copy"), QByteArray("precious\n"));
-    QVERIFY(S_ISREG(statOf(list).st_mode));
-    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/allowed_user_list.conf"), QByteArray("carl\nalice\ndora\n"));
+    QVERIFY(engine.root.writeFile("/srv/repo/vsftpd.conf", engine.root.readFile("/etc/vsftpd.conf"), 0600));
+    const QString link = engine.root.filePath("/etc/vsftpd.conf");
+    const QString target = engine.root.filePath("/srv/repo/vsftpd.conf");
+    QVERIFY(QFile::remove(link));
+    QVERIFY(QFile::link(target, link));
+    if (plant == QLatin1String("chown-link"))
+        QCOMPARE(::lchown(QFile::encodeName(link).constData(), 1000, 1000), 0);
+    if (plant == QLatin1String("open-dir"))
+        QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath("/etc")).constData(), 0777), 0);
+    if (plant == QLatin1String("open-target-dir"))
+        QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath("/srv/repo")).constData(), 0775), 0);
+    const QByteArray before = engine.root.readFile("/srv/repo/vsftpd.conf");
+
+    setValue(engine.config->mainConfig().elements, "", "ftpd_banner", "changed");
+    QCOMPARE(engine.config->save(), kept);
+    QVERIFY(QFileInfo(link).isSymLink());
+    QCOMPARE(statOf(target).st_mode & 07777, 0600u);
+    if (kept) {
+        QVERIFY(engine.root.readFile("/srv/repo/vsftpd.conf").contains("ftpd_banner=changed"));
+        QCOMPARE(engine.interaction.records.size(), 0);
+    } else {
+        QCOMPARE(engine.root.readFile("/srv/repo/vsftpd.conf"), before);
+        QCOMPARE(engine.interaction.records.size(), 1);
+        QCOMPARE(engine.interaction.records[0].message.text, QString("Unable to save /etc/vsftpd.conf"));
+        QVERIFY(!engine.interaction.records[0].message.detailedText.isEmpty());
+    }
 }
 
 void TestSave::writerRefusesDirectories()
 {
     FixtureRoot root;
     QVERIFY(root.makeDirectory("/etc/dir"));
-    QVERIFY(writeFileAtomically(root.filePath("/etc/dir"), "x").startsWith("the target is a directory"));
-    QVERIFY(writeFileAtomically(root.filePath("/missing/dir/file"), "x").startsWith("cannot create a temporary file"));
+    QVERIFY(writeFileAtomically(root.filePath("/etc/dir"), "x")
+                .value_or(QString())
+                .startsWith("the target is a directory"));
+    QVERIFY(writeFileAtomically(root.filePath("/missing/dir/file"), "x")
+                .value_or(QString())
+                .startsWith("cannot create a temporary file"));
 }
 
 void TestSave::hiddenFilesAreNoUsers()
@@ -331,5 +368,5 @@ void TestSave::serverReadsTheProgramsUserlist()
     QVERIFY(engine.root.exists("/etc/vsftpd.d/allowed_user_list.conf"));
 }
 
-QTEST_GUILESS_MAIN(TestSave)
+FTPCONFIG_TEST_GUILESS_MAIN(TestSave)
 #include "TestSave.moc"

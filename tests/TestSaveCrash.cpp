@@ -1,5 +1,6 @@
 // Kills a saving process at random points, many times, and checks that every
 // file is then either its old or its new version: never torn, never empty.
+#include "TestMain.h"
 #include "FixtureRoot.h"
 #include "Process.h"
 
@@ -13,7 +14,7 @@
 
 namespace {
 
-const QString Child = QStringLiteral(FTPCONFIG_BINARY_DIR "/tests/savechild");
+const QString Child = QStringLiteral(FTPCONFIG_SAVECHILD);
 
 QMap<QString, QByteArray> snapshot(const QString &root, QStringList *leftovers = nullptr)
 {
@@ -156,5 +157,5 @@ void TestSaveCrash::killedMidSave()
     QVERIFY(partial > 0);
 }
 
-QTEST_GUILESS_MAIN(TestSaveCrash)
+FTPCONFIG_TEST_GUILESS_MAIN(TestSaveCrash)
 #include "TestSaveCrash.moc"

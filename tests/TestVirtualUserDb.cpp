@@ -1,3 +1,4 @@
+#include "TestMain.h"
 #include "CaptureStream.h"
 #include "Process.h"
 #include "TemporaryRoot.h"
@@ -411,5 +412,5 @@ void TestVirtualUserDb::readOnlyCreatesNothing()
     QCOMPARE(QDir(root.filePath("/var/lib/ftpconfig")).entryList(QDir::AllEntries | QDir::Hidden), before);
 }
 
-QTEST_GUILESS_MAIN(TestVirtualUserDb)
+FTPCONFIG_TEST_GUILESS_MAIN(TestVirtualUserDb)
 #include "TestVirtualUserDb.moc"

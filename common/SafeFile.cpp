@@ -35,10 +35,62 @@ bool writeAll(int fd, const QByteArray &content)
     return true;
 }
 
+// Only root can have made the directory, and only root can change it: each
+// from dir up to and including top (or "/" when dir is not below top).
+bool onlyRootWrites(const QString &dir, const QString &top)
+{
+    const QString stop = (dir == top || dir.startsWith(top + QLatin1Char('/'))) ? top : QStringLiteral("/");
+    QString current = dir;
+    for (;;) {
+        struct stat info
+        {
+        };
+        if (::stat(QFile::encodeName(current).constData(), &info) != 0 || info.st_uid != 0
+            || (info.st_mode & (S_IWGRP | S_IWOTH)))
+            return false;
+        if (current == stop || current == QLatin1String("/"))
+            return true;
+        current = QFileInfo(current).absolutePath();
+    }
+}
+
+// The file a chain of links at path ends in, when root alone made every
+// link and root alone can change the directories they live in; an error
+// otherwise. A path that is no link is its own end.
+std::optional<QString> linkTarget(const QString &path, const QString &trustedTop, QString &target)
+{
+    target = path;
+    for (int hops = 0;; ++hops) {
+        struct stat info
+        {
+        };
+        const QByteArray name = QFile::encodeName(target);
+        if (::lstat(name.constData(), &info) != 0 || !S_ISLNK(info.st_mode)) {
+            if (hops > 0 && !onlyRootWrites(QFileInfo(target).absolutePath(), trustedTop))
+                return QStringLiteral("the link %1 leads into %2, which others than root may change")
+                    .arg(path, QFileInfo(target).absolutePath());
+            return std::nullopt;
+        }
+        if (hops == 8)
+            return QStringLiteral("too many links at %1").arg(path);
+        if (info.st_uid != 0 || !onlyRootWrites(QFileInfo(target).absolutePath(), trustedTop))
+            return QStringLiteral("%1 is a link that someone other than root could have planted").arg(target);
+        const QString next = QFile::symLinkTarget(target);
+        if (next.isEmpty())
+            return systemError("cannot read the link", errno);
+        target = QDir::cleanPath(next);
+    }
+}
+
 } // namespace
 
-QString writeFileAtomically(const QString &path, const QByteArray &content, mode_t newFileMode)
+std::optional<QString> writeFileAtomically(const QString &linkPath, const QByteArray &content, mode_t newFileMode,
+                                           const QString &trustedTop)
 {
+    // A link root made is kept, and the file it leads to is replaced.
+    QString path;
+    if (const auto refused = linkTarget(linkPath, QDir::cleanPath(trustedTop), path))
+        return refused;
     const QByteArray target = QFile::encodeName(path);
     const QFileInfo info(path);
     const QByteArray directory = QFile::encodeName(info.absolutePath());
@@ -51,8 +103,6 @@ QString writeFileAtomically(const QString &path, const QByteArray &content, mode
     if (::lstat(target.constData(), &existing) == 0) {
         if (S_ISDIR(existing.st_mode))
             return systemError("the target is a directory", EISDIR);
-        // A symlink is replaced by a file of the default mode: writing
-        // through it could reach any file of the system.
         if (S_ISREG(existing.st_mode)) {
             mode = existing.st_mode & 07777;
             owner = std::make_pair(existing.st_uid, existing.st_gid);
@@ -100,7 +150,7 @@ QString writeFileAtomically(const QString &path, const QByteArray &content, mode
         ::fsync(dirFd);
         ::close(dirFd);
     }
-    return QString();
+    return std::nullopt;
 }
 
 std::optional<QString> invalidNameReason(const QByteArray &name)

@@ -1,6 +1,6 @@
 #include "AccessReport.h"
 
-#include "policy/AppStrings.h"
+#include "common/AppStrings.h"
 #include "policy/FtpServerConfig.h"
 
 #include <QJsonArray>

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "config/ConfigFile.h"
-#include "policy/VsftpdSettings.h"
+#include "forecast/VsftpdSettings.h"
 
 #include <QByteArray>
 #include <QDate>

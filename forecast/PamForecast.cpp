@@ -224,7 +224,8 @@ PamForecast::ModuleAnswer PamForecast::runUnix(const Line &line, const QByteArra
                     QStringLiteral("the password in %1 is empty, and without nullok pam_unix refuses it").arg(where)};
         }
         if (hash.startsWith('!') || hash.startsWith('*'))
-            return {AuthErr, QStringLiteral("the password is locked (\"%1\" in %2)").arg(QChar(hash[0]), where)};
+            return {AuthErr,
+                    QStringLiteral("the password is locked (\"%1\" in %2)").arg(QString(QLatin1Char(hash[0])), where)};
         return {Success, QString()};
     }
     // account

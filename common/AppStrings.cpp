@@ -2,13 +2,6 @@
 
 #include <QCoreApplication>
 
-namespace {
-QString tr(const char *text)
-{
-    return QCoreApplication::translate("AppStrings", text);
-}
-} // namespace
-
 const AppStrings &AppStrings::instance()
 {
     static const AppStrings strings;

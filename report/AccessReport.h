@@ -2,7 +2,7 @@
 
 #include "policy/AccessFailure.h"
 #include "policy/Interaction.h"
-#include "policy/LoginForecast.h"
+#include "forecast/LoginForecast.h"
 
 #include <QByteArray>
 #include <QList>

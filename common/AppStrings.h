@@ -1,5 +1,6 @@
 #pragma once
 
+#include <QCoreApplication>
 #include <QString>
 #include <QStringList>
 
@@ -7,6 +8,8 @@
 // fixed paths, built once on first use.
 class AppStrings
 {
+    Q_DECLARE_TR_FUNCTIONS(AppStrings)
+
 public:
     static const AppStrings &instance();
 

@@ -1,7 +1,7 @@
 // ftpconfig-report: who can log in to vsftpd, and why not, on the command
 // line. Reads everything read-only and prints one row per user.
-#include "policy/AccessReport.h"
 #include "policy/FtpServerConfig.h"
+#include "report/AccessReport.h"
 
 #include <QCoreApplication>
 #include <QDir>

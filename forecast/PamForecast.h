@@ -1,7 +1,7 @@
 #pragma once
 
 #include "config/ConfigFile.h"
-#include "policy/RootDirectory.h"
+#include "common/RootDirectory.h"
 
 #include <QByteArray>
 #include <QDate>

@@ -1,8 +1,8 @@
 #include "LoginForecast.h"
 
-#include "policy/AppStrings.h"
+#include "common/AppStrings.h"
+#include "forecast/PamForecast.h"
 #include "policy/FtpServerConfig.h"
-#include "policy/PamForecast.h"
 
 #include <QFile>
 #include <QFileInfo>

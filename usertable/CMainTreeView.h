@@ -1,0 +1,19 @@
+#pragma once
+
+#include <QTreeView>
+
+// The users tree of the main window. It announces the row the operator
+// moves to, whether by mouse, keyboard or a filter that re-selects a row.
+class CMainTreeView : public QTreeView
+{
+    Q_OBJECT
+
+public:
+    explicit CMainTreeView(QWidget *parent = nullptr);
+
+signals:
+    void selected(const QModelIndex &index);
+
+protected:
+    void currentChanged(const QModelIndex &current, const QModelIndex &previous) override;
+};
