@@ -72,6 +72,12 @@ public:
     // The directory that becomes the user's FTP root, as the administrator
     // knows it (not resolved under the root directory).
     QByteArray effectiveRoot(const QByteArray &user) const;
+    // The directory the user's sessions start in, as the administrator wrote
+    // it (local_root, anon_root) or else the home the server falls back to:
+    // the FTP root once the user is confined.
+    QByteArray configuredRoot(const QByteArray &user) const;
+    // Virtual users of the table: those removed but not yet saved are gone.
+    QList<QByteArray> virtualUserNames() const;
     // The system account whose rights the user's FTP session has.
     QByteArray ftpAccountName(const QByteArray &user) const;
 
@@ -113,6 +119,13 @@ public:
     // program's defaults.
     QByteArray configuredUserlistPath() const;
     QByteArray configuredChrootListPath() const;
+
+    // Options of the main configuration, as the options dialog changes them;
+    // both mark the configuration modified. optionsChanged() follows what
+    // the changed options name (another chroot list).
+    void setOption(const QByteArray &key, const QByteArray &value);
+    void removeOption(const QByteArray &key);
+    void optionsChanged();
 
     // Main configuration value of a key, or the default when absent.
     QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;
@@ -192,6 +205,7 @@ private:
     QSet<QByteArray> m_ftpusersIndex;
     bool m_ftpusersIndexValid = false;
     std::optional<bool> m_skipPamCheck;
+    bool m_pamSkipped = false;
     QByteArray m_userlistPath;
     NameList m_userlist;
     bool m_userlistModified = false;
@@ -201,6 +215,7 @@ private:
     QByteArray m_userConfigDir;
     std::map<QByteArray, std::shared_ptr<ConfigFile>> m_userConfigs;
     QByteArray m_dbPath;
+    QByteArray m_dbConfiguredPath; // as the PAM file's db= names it
     std::unique_ptr<AccountStore> m_accounts;
     bool m_modified = false;
     // How each document printed when it was loaded: a save leaves a file

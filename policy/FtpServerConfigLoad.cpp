@@ -20,10 +20,11 @@ void FtpServerConfig::load()
     const QByteArray db = QByteArray::fromStdString(moduleArgument(m_pam.elements, "pam_userdb.so", "db"));
     if (db.isEmpty()) {
         const AppStrings &strings = AppStrings::instance();
-        m_dbPath = QFile::encodeName(strings.stateDirectory + QLatin1Char('/') + strings.virtualUsersDbName);
+        m_dbConfiguredPath = QFile::encodeName(strings.stateDirectory + QLatin1Char('/') + strings.virtualUsersDbName);
     } else {
-        m_dbPath = db.endsWith(".db") ? db : db + ".db";
+        m_dbConfiguredPath = db;
     }
+    m_dbPath = m_dbConfiguredPath.endsWith(".db") ? m_dbConfiguredPath : m_dbConfiguredPath + ".db";
     loadUserlist();
     loadFtpusers();
     loadChrootList();
@@ -162,7 +163,10 @@ void FtpServerConfig::loadVirtualUsers()
     const auto access = m_mode == Mode::ReadOnly ? AccountStore::Access::ReadOnly : AccountStore::Access::ReadWrite;
     m_accounts = std::make_unique<AccountStore>(QByteArray(), m_root, access);
     try {
-        m_accounts->loadVirtualUsers(m_dbPath);
+        // As the PAM file writes it: a recovery deletes the configured path
+        // as written, and with ".db" appended here that would be the very
+        // file pam_userdb reads.
+        m_accounts->loadVirtualUsers(m_dbConfiguredPath);
     } catch (const std::exception &e) {
         m_interaction.critical(tr("Error in creating database"),
                                tr("Unable lo load or create virtual user database.\nError message: ")

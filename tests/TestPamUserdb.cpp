@@ -1,10 +1,16 @@
 // Real PAM reads what the store writes: pam_userdb, driven by pamtester,
 // authenticates the virtual users against the database file we saved. Runs
 // only inside scripts/with-private-etc.sh, which gives it a private /etc.
-#include "TestMain.h"
+#include "CaptureStream.h"
+#include "FixtureRoot.h"
 #include "Process.h"
+#include "ScriptedInteraction.h"
 #include "TemporaryRoot.h"
+#include "TestMain.h"
 #include "accounts/AccountStore.h"
+#include "policy/FtpServerConfig.h"
+
+#include <iostream>
 
 #include <QFile>
 #include <QtTest>
@@ -45,8 +51,10 @@ class TestPamUserdb : public QObject
 private slots:
     void initTestCase();
     void pamReadsTheStore();
+    void recoveryKeepsUntouchedUsers();
 
 private:
+    void writePamService(const QByteArray &db);
     // Checks each login with pamtester: authentication and account stacks.
     void expectLogins(const QList<Login> &logins, const char *phase);
 };
@@ -71,15 +79,9 @@ void TestPamUserdb::expectLogins(const QList<Login> &logins, const char *phase)
     }
 }
 
-void TestPamUserdb::pamReadsTheStore()
+// pam_userdb appends ".db" itself: the PAM file names the path without it.
+void TestPamUserdb::writePamService(const QByteArray &db)
 {
-    TemporaryRoot root;
-    QVERIFY(root.writeFile("/etc/passwd", "root:x:0:0::/root:/bin/sh\n"));
-    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
-    QVERIFY(root.writeFile("/etc/group", "root:x:0:\n"));
-
-    // pam_userdb appends ".db" itself: the PAM file names the path without it.
-    const QByteArray db = QFile::encodeName(root.filePath(QString::fromUtf8(DbPath)));
     QFile pam(QStringLiteral("/etc/pam.d/") + Service);
     QVERIFY(pam.open(QIODevice::WriteOnly | QIODevice::Truncate));
     pam.write("auth sufficient pam_userdb.so db=" + db
@@ -90,6 +92,16 @@ void TestPamUserdb::pamReadsTheStore()
                 "auth required pam_deny.so\n"
                 "account required pam_deny.so\n");
     pam.close();
+}
+
+void TestPamUserdb::pamReadsTheStore()
+{
+    TemporaryRoot root;
+    QVERIFY(root.writeFile("/etc/passwd", "root:x:0:0::/root:/bin/sh\n"));
+    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
+    QVERIFY(root.writeFile("/etc/group", "root:x:0:\n"));
+
+    writePamService(QFile::encodeName(root.filePath(QString::fromUtf8(DbPath))));
 
     {
         AccountStore store(DbPath, RootDirectory(root.path()));
@@ -123,6 +135,37 @@ void TestPamUserdb::pamReadsTheStore()
     QCOMPARE(reloaded.virtualUsers().size(), size_t(2));
     QVERIFY(reloaded.isVirtualUser("anne"));
     QVERIFY(reloaded.isVirtualUser("ben"));
+}
+
+// The environment breaks while the program runs; the save rebuilds it, and
+// the users nobody touched must still log in afterwards.
+void TestPamUserdb::recoveryKeepsUntouchedUsers()
+{
+    FixtureRoot root;
+    QVERIFY(root.write({{"/etc/pam.d/vsftpd",
+                         "auth sufficient pam_userdb.so db=" + DbPath
+                             + "\n"
+                               "account sufficient pam_userdb.so db="
+                             + DbPath + "\n"}}));
+    QVERIFY(root.writeVirtualUsers(QString::fromUtf8(DbPath + ".db"), {{"anna", "a1"}, {"ben", "b2"}}));
+    writePamService(QFile::encodeName(root.filePath(QString::fromUtf8(DbPath))));
+
+    ScriptedInteraction interaction;
+    CaptureStream out(std::cout);
+    CaptureStream err(std::cerr);
+    FtpServerConfig config(interaction, RootDirectory(root.path()));
+    config.load();
+    config.accounts().addVirtualUser("carl", "c3");
+    // Garbage over the environment's shared region, as a crash might leave it.
+    QFile region(root.filePath(QStringLiteral("/var/lib/ftpconfig/__db.001")));
+    QVERIFY(region.open(QIODevice::ReadWrite));
+    QVERIFY(region.write(QByteArray(int(region.size()), '\x7f')) > 0);
+    region.close();
+
+    config.save();
+    QVERIFY2(QString::fromStdString(err.text()).contains(QLatin1String("Db env. error. Re-creating database")),
+             err.text().c_str());
+    expectLogins({{"anna", "a1", true}, {"ben", "b2", true}, {"carl", "c3", true}}, "after the recovery");
 }
 
 FTPCONFIG_TEST_GUILESS_MAIN(TestPamUserdb)
