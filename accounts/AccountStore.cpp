@@ -114,6 +114,35 @@ QByteArray AccountStore::shadowPassword(const QByteArray &name) const
     return it == m_shadow.end() ? QByteArray() : it->second.password;
 }
 
+uint32_t AccountStore::firstUserId() const
+{
+    if (!m_firstUserId) {
+        m_firstUserId = 1000; // Debian's UID_MIN when login.defs does not say
+        QFile defs(m_root.resolve(QStringLiteral("/etc/login.defs")));
+        if (defs.open(QIODevice::ReadOnly)) {
+            for (const QByteArray &line : defs.readAll().split('\n')) {
+                const QList<QByteArray> words = line.simplified().split(' ');
+                bool ok = false;
+                const uint32_t value = words.size() >= 2 && words[0] == "UID_MIN" ? words[1].toUInt(&ok) : 0;
+                if (ok)
+                    m_firstUserId = value;
+            }
+        }
+    }
+    return *m_firstUserId;
+}
+
+bool AccountStore::isSystemUser(const QByteArray &name) const
+{
+    AccountRecord record;
+    if (!getUserInfo(name, record))
+        return false;
+    if (record.uid < firstUserId())
+        return true;
+    const QByteArray shell = record.shell.mid(record.shell.lastIndexOf('/') + 1);
+    return shell == "nologin" || shell == "false";
+}
+
 bool AccountStore::isBadPassword(const QByteArray &name) const
 {
     for (const auto *map : {&m_passwd, &m_shadow}) {

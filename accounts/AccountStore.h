@@ -10,6 +10,7 @@
 #include <cstdint>
 #include <map>
 #include <memory>
+#include <optional>
 #include <set>
 
 struct AccountRecord
@@ -46,6 +47,9 @@ public:
     // Exactly "!" or "*" in passwd or shadow: a locked hash ("!$6$...") or
     // "!!" is not bad.
     bool isBadPassword(const QByteArray &name) const;
+    // As Debian decides it: an id below UID_MIN of login.defs, or a shell
+    // that cannot log in. Names that are no account are not system users.
+    bool isSystemUser(const QByteArray &name) const;
     // Supplementary groups in gid order, then the primary group.
     QList<QByteArray> userGroups(const QByteArray &name) const;
     bool isUserInGroup(const QByteArray &name, const QByteArray &groupName) const;
@@ -78,8 +82,11 @@ private:
     void loadShadow();
     void loadGroups();
 
+    uint32_t firstUserId() const;
+
     RootDirectory m_root;
     Access m_access;
+    mutable std::optional<uint32_t> m_firstUserId;
     std::map<QByteArray, AccountRecord> m_passwd;
     std::map<QByteArray, AccountRecord> m_shadow;
     std::map<uint32_t, GroupRecord> m_groups;

@@ -85,8 +85,11 @@ bool FtpServerConfig::isChrooted(const QByteArray &user) const
 
 QByteArray FtpServerConfig::effectiveRoot(const QByteArray &user) const
 {
-    if (!isChrooted(user))
-        return "/";
+    return isChrooted(user) ? configuredRoot(user) : QByteArray("/");
+}
+
+QByteArray FtpServerConfig::configuredRoot(const QByteArray &user) const
+{
     if (const ConfigFile *own = userConfig(user)) {
         if (const auto localRoot = findData(own->elements, "", "local_root"))
             return QByteArray::fromStdString(localRoot->value);
@@ -105,6 +108,44 @@ QByteArray FtpServerConfig::effectiveRoot(const QByteArray &user) const
     if (isVirtualUser(user) && isYes("guest_enable"))
         return homeOf(value("guest_username", "ftp"));
     return homeOf(user);
+}
+
+QList<QByteArray> FtpServerConfig::virtualUserNames() const
+{
+    QList<QByteArray> names;
+    if (!m_accounts)
+        return names;
+    for (const auto &[name, record] : m_accounts->virtualUsers()) {
+        if (record.state != VirtualUserState::Deleted)
+            names.append(name);
+    }
+    return names;
+}
+
+void FtpServerConfig::setOption(const QByteArray &key, const QByteArray &value)
+{
+    setValue(m_main.elements, "", key.toStdString(), value.toStdString());
+    m_modified = true;
+}
+
+void FtpServerConfig::removeOption(const QByteArray &key)
+{
+    const std::string name = key.toStdString();
+    const auto before = m_main.elements.size();
+    m_main.elements.remove_if([&](const ConfigElementPtr &element) {
+        const auto data = std::dynamic_pointer_cast<ConfigElementData>(element);
+        return data && data->key == name;
+    });
+    if (m_main.elements.size() != before)
+        m_modified = true;
+}
+
+void FtpServerConfig::optionsChanged()
+{
+    // The options may name another chroot list: the table judges users by
+    // the list the server will read.
+    if (configuredChrootListPath() != m_chrootListPath)
+        loadChrootList();
 }
 
 QByteArray FtpServerConfig::ftpAccountName(const QByteArray &user) const

@@ -43,6 +43,10 @@ bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, A
         return true;
     if (!isVirtualUser(user))
         return true;
+    // Skip holds for the rest of this run: the table checks every virtual
+    // user, and thousands of them would each ask again.
+    if (m_pamSkipped)
+        return false;
     if (m_pam.elements.empty()) {
         std::cerr << "Invalid db path" << std::endl;
         return true;
@@ -68,8 +72,10 @@ bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, A
         if (!sufficient || module == line->tokens.end()
             || (module->text.size() >= 13 && !endsWith(module->text, "pam_userdb.so"))) {
             const Interaction::PamChoice choice = m_interaction.askPamProblem();
-            if (choice == Interaction::PamChoice::Skip)
+            if (choice == Interaction::PamChoice::Skip) {
+                m_pamSkipped = true;
                 return false;
+            }
             if (choice == Interaction::PamChoice::Valid) {
                 QSettings().setValue(QStringLiteral("skip_pam_check"), true);
                 m_skipPamCheck = true;

@@ -1,6 +1,6 @@
-#include "TestMain.h"
 #include "CaptureStream.h"
 #include "TemporaryRoot.h"
+#include "TestMain.h"
 #include "accounts/AccountStore.h"
 
 #include <QtTest>
@@ -32,6 +32,8 @@ private slots:
     void missingFiles_data();
     void missingFiles();
     void systemEnumeration();
+    void systemUsers_data();
+    void systemUsers();
     void names();
 };
 
@@ -178,6 +180,41 @@ void TestAccountStore::systemEnumeration()
     QVERIFY(store.getUserInfo("root", root));
     QCOMPARE(root.uid, 0u);
     QVERIFY(!store.groups().empty());
+}
+
+void TestAccountStore::systemUsers_data()
+{
+    QTest::addColumn<QByteArray>("loginDefs"); // "-" for no login.defs
+    QTest::addColumn<QByteArray>("passwdLine");
+    QTest::addColumn<bool>("system");
+
+    const QByteArray debian = "# comment\nUID_MIN\t\t\t 1000\nUID_MAX 60000\n";
+    QTest::newRow("person") << debian << QByteArray("ann:x:1000:1000::/home/ann:/bin/bash") << false;
+    QTest::newRow("service account") << debian << QByteArray("www-data:x:33:33::/var/www:/usr/sbin/nologin") << true;
+    QTest::newRow("low id with a shell") << debian << QByteArray("root:x:0:0::/root:/bin/bash") << true;
+    QTest::newRow("high id, nologin") << debian << QByteArray("svc:x:5000:5000::/srv:/usr/sbin/nologin") << true;
+    QTest::newRow("high id, false") << debian << QByteArray("svc:x:5000:5000::/srv:/bin/false") << true;
+    QTest::newRow("UID_MIN raised") << QByteArray("UID_MIN 2000\n") << QByteArray("ann:x:1500:1500::/h:/bin/sh")
+                                    << true;
+    QTest::newRow("no login.defs") << QByteArray("-") << QByteArray("ann:x:999:999::/h:/bin/sh") << true;
+    QTest::newRow("empty shell is sh") << debian << QByteArray("ann:x:1001:1001::/h:") << false;
+}
+
+void TestAccountStore::systemUsers()
+{
+    QFETCH(QByteArray, loginDefs);
+    QFETCH(QByteArray, passwdLine);
+    QFETCH(bool, system);
+
+    TemporaryRoot root;
+    QVERIFY(root.writeFile("/etc/passwd", passwdLine + '\n'));
+    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
+    QVERIFY(root.writeFile("/etc/group", ""));
+    if (loginDefs != "-")
+        QVERIFY(root.writeFile("/etc/login.defs", loginDefs));
+    const AccountStore store({}, RootDirectory(root.path()));
+    QCOMPARE(store.isSystemUser(passwdLine.left(passwdLine.indexOf(':'))), system);
+    QVERIFY(!store.isSystemUser("no-such-account"));
 }
 
 void TestAccountStore::names()
