@@ -1,0 +1,510 @@
+#include "TreeModel.h"
+
+#include "common/AppStrings.h"
+#include "common/RootDirectory.h"
+#include "common/SafeFile.h"
+#include "forecast/LoginForecast.h"
+#include "policy/FtpServerConfig.h"
+#include "policy/Interaction.h"
+
+#include <QBrush>
+#include <QColor>
+#include <QPalette>
+
+struct TreeModel::Item
+{
+    enum class Kind { Group, User, Anonymous };
+
+    Kind kind = Kind::Group;
+    QByteArray name; // as the engine knows it
+    QString label;
+    Item *parent = nullptr;
+    int row = 0;
+    std::vector<std::unique_ptr<Item>> children;
+
+    // Filled from the engine when first shown, and again after a change.
+    bool computed = false;
+    bool allowed = false;
+    AccessFailure failure;
+    QString directory;
+    QString mode;
+    std::optional<UserForecast> forecast;
+
+    Item *append(std::unique_ptr<Item> child)
+    {
+        child->parent = this;
+        child->row = static_cast<int>(children.size());
+        children.push_back(std::move(child));
+        return children.back().get();
+    }
+};
+
+namespace {
+
+std::unique_ptr<TreeModel::Item> makeItem(TreeModel::Item::Kind kind, const QByteArray &name, const QString &label)
+{
+    auto item = std::make_unique<TreeModel::Item>();
+    item->kind = kind;
+    item->name = name;
+    item->label = label;
+    return item;
+}
+
+} // namespace
+
+TreeModel::TreeModel(const QStringList &titles, Interaction &interaction, QObject *parent)
+    : QAbstractItemModel(parent)
+    , m_interaction(interaction)
+    , m_config(std::make_unique<FtpServerConfig>(interaction, RootDirectory::fromEnvironment()))
+    , m_groupIcon(QStringLiteral(":/prefix/icons/arrow_right.png"))
+    , m_allowedIcon(QStringLiteral(":/prefix/icons/user_green.png"))
+    , m_deniedIcon(QStringLiteral(":/prefix/icons/user_red.png"))
+{
+    m_titles = titles;
+    m_config->load();
+    buildRows();
+}
+
+TreeModel::~TreeModel() = default;
+
+void TreeModel::buildRows()
+{
+    const AppStrings &strings = AppStrings::instance();
+    m_root = makeItem(Item::Kind::Group, {}, QString());
+    Item *everybody = m_root->append(makeItem(Item::Kind::Group, {}, strings.everybody));
+    m_localUsers = everybody->append(makeItem(Item::Kind::Group, {}, strings.localUsers));
+    m_virtualUsers = everybody->append(makeItem(Item::Kind::Group, {}, strings.virtualUsers));
+    everybody->append(makeItem(Item::Kind::Anonymous, strings.anonymousUsers.toLocal8Bit(), strings.anonymousUsers));
+    for (const auto &entry : m_config->accounts().accounts())
+        m_localUsers->append(makeItem(Item::Kind::User, entry.first, QString::fromUtf8(entry.first)));
+    const QList<QByteArray> virtualNames = m_config->virtualUserNames();
+    for (const QByteArray &name : virtualNames)
+        m_virtualUsers->append(makeItem(Item::Kind::User, name, QString::fromUtf8(name)));
+    m_forecast.reset();
+    // The PAM check may ask the operator: ask now, with nothing painted yet,
+    // rather than from inside a paint when the first virtual row is shown.
+    if (!virtualNames.isEmpty())
+        compute(*m_virtualUsers->children.front());
+}
+
+TreeModel::Item *TreeModel::itemOf(const QModelIndex &index) const
+{
+    return index.isValid() ? static_cast<Item *>(index.internalPointer()) : m_root.get();
+}
+
+void TreeModel::compute(Item &item) const
+{
+    if (item.computed || item.kind == Item::Kind::Group)
+        return;
+    item.computed = true;
+    item.failure = AccessFailure();
+    item.allowed = m_config->checkAccess(item.name, false, &item.failure);
+    item.directory = QString::fromUtf8(m_config->configuredRoot(item.name));
+    item.mode = rightsText(m_config->userRights(item.name));
+    item.forecast.reset();
+}
+
+const UserForecast &TreeModel::forecastOf(Item &item) const
+{
+    if (!item.forecast) {
+        item.forecast = const_cast<TreeModel *>(this)->loginForecastMutable().forecast(item.name);
+    }
+    return *item.forecast;
+}
+
+LoginForecast &TreeModel::loginForecastMutable()
+{
+    if (!m_forecast)
+        m_forecast = std::make_unique<LoginForecast>(*m_config);
+    return *m_forecast;
+}
+
+const LoginForecast &TreeModel::loginForecast() const
+{
+    return const_cast<TreeModel *>(this)->loginForecastMutable();
+}
+
+QModelIndex TreeModel::index(int row, int column, const QModelIndex &parent) const
+{
+    if (!hasIndex(row, column, parent))
+        return {};
+    Item *parentItem = itemOf(parent);
+    return createIndex(row, column, parentItem->children[static_cast<size_t>(row)].get());
+}
+
+QModelIndex TreeModel::parent(const QModelIndex &index) const
+{
+    if (!index.isValid())
+        return {};
+    Item *parentItem = itemOf(index)->parent;
+    if (!parentItem || parentItem == m_root.get())
+        return {};
+    return createIndex(parentItem->row, 0, parentItem);
+}
+
+int TreeModel::rowCount(const QModelIndex &parent) const
+{
+    if (parent.column() > 0)
+        return 0;
+    return static_cast<int>(itemOf(parent)->children.size());
+}
+
+int TreeModel::columnCount(const QModelIndex &) const
+{
+    return static_cast<int>(m_titles.size());
+}
+
+QVariant TreeModel::data(const QModelIndex &index, int role) const
+{
+    if (!index.isValid())
+        return {};
+    Item &item = *itemOf(index);
+    const AppStrings &strings = AppStrings::instance();
+    const bool user = item.kind != Item::Kind::Group;
+    if (user && role != Qt::SizeHintRole)
+        compute(item);
+    const int column = index.column();
+
+    if (role == Qt::DisplayRole || role == Qt::EditRole) {
+        switch (column) {
+        case UsersColumn:
+            return item.label;
+        case StatusColumn:
+            return user ? (item.allowed ? strings.allowed : strings.denied) : QString();
+        case DirectoryColumn:
+            return user ? item.directory : QString();
+        case ModeColumn:
+            return user ? item.mode : QString();
+        case ServerColumn:
+            return user ? forecastStatusText(forecastOf(item).status) : QString();
+        default:
+            return {};
+        }
+    }
+    if (role == Qt::DecorationRole && column == UsersColumn) {
+        if (!user)
+            return m_groupIcon;
+        return item.allowed ? m_allowedIcon : m_deniedIcon;
+    }
+    if (!user)
+        return {};
+    if (role == Qt::ToolTipRole) {
+        if (column == StatusColumn) {
+            if (item.allowed)
+                return strings.allowed;
+            return tr("%1: %2\n%3").arg(strings.denied, failureKindText(item.failure.kind), item.failure.message);
+        }
+        if (column == ServerColumn) {
+            const UserForecast &forecast = forecastOf(item);
+            if (forecast.findings.isEmpty())
+                return forecastStatusText(forecast.status);
+            const ForecastFinding &first = forecast.findings.first();
+            QString where = first.file;
+            if (!where.isEmpty() && first.line > 0)
+                where += QLatin1Char(':') + QString::number(first.line);
+            return where.isEmpty() ? first.message : where + QStringLiteral(": ") + first.message;
+        }
+        return {};
+    }
+    if (role == Qt::ForegroundRole && column == ServerColumn) {
+        // The server disagreeing with the verdict is what the column is for.
+        const ForecastStatus status = forecastOf(item).status;
+        if ((status == ForecastStatus::Denied && item.allowed) || (status == ForecastStatus::Allowed && !item.allowed))
+            return QBrush(QColor(0xc0, 0x39, 0x2b));
+        return {};
+    }
+    if (role == FailureKindRole)
+        return static_cast<uint>(item.failure.kind);
+    if (role == ForecastRole && column == ServerColumn)
+        return static_cast<int>(forecastOf(item).status);
+    return {};
+}
+
+bool TreeModel::setData(const QModelIndex &index, const QVariant &value, int role)
+{
+    if (!index.isValid() || role != Qt::EditRole)
+        return false;
+    Item &item = *itemOf(index);
+    if (item.kind == Item::Kind::Group)
+        return false;
+    compute(item);
+    bool changed = false;
+    switch (index.column()) {
+    case UsersColumn:
+        return rename(item, value.toString());
+    case StatusColumn: {
+        const QString status = value.toString();
+        const AppStrings &strings = AppStrings::instance();
+        if (status != strings.allowed && status != strings.denied) {
+            invalidData(QString());
+            return false;
+        }
+        changed = setStatus(item, status == strings.allowed);
+        break;
+    }
+    case DirectoryColumn:
+        changed = setDirectory(item, value.toString());
+        break;
+    case ModeColumn:
+        changed = setMode(item, value.toString());
+        break;
+    default:
+        return false;
+    }
+    if (changed)
+        markChanged();
+    return changed;
+}
+
+QVariant TreeModel::headerData(int section, Qt::Orientation orientation, int role) const
+{
+    if (orientation == Qt::Horizontal && role == Qt::DisplayRole && section >= 0 && section < m_titles.size())
+        return m_titles[section];
+    return {};
+}
+
+bool TreeModel::setHeaderData(int section, Qt::Orientation orientation, const QVariant &value, int role)
+{
+    if (orientation != Qt::Horizontal || role != Qt::EditRole || section < 0 || section >= m_titles.size())
+        return false;
+    m_titles[section] = value.toString();
+    emit headerDataChanged(orientation, section, section);
+    return true;
+}
+
+Qt::ItemFlags TreeModel::flags(const QModelIndex &index) const
+{
+    if (!index.isValid())
+        return Qt::NoItemFlags;
+    const Qt::ItemFlags base = Qt::ItemIsEnabled | Qt::ItemIsSelectable;
+    const Item &item = *itemOf(index);
+    if (item.kind == Item::Kind::Group || index.column() == ServerColumn)
+        return base;
+    // Names of others than virtual users are editable too, so that the
+    // operator learns why they cannot change.
+    if (index.column() == UsersColumn && item.kind == Item::Kind::Anonymous)
+        return base;
+    return base | Qt::ItemIsEditable;
+}
+
+FtpServerConfig &TreeModel::config()
+{
+    return *m_config;
+}
+
+bool TreeModel::hasUnsavedChanges() const
+{
+    return m_unsaved;
+}
+
+void TreeModel::setUnsavedChanges(bool unsaved)
+{
+    m_unsaved = unsaved;
+}
+
+void TreeModel::rebuild()
+{
+    beginResetModel();
+    buildRows();
+    endResetModel();
+    emit engineChanged();
+}
+
+void TreeModel::removeVirtualUser(const QModelIndex &index)
+{
+    if (!isInVirtualGroup(index))
+        return;
+    m_config->accounts().removeVirtualUser(itemOf(index)->name);
+    m_unsaved = true;
+    rebuild();
+    const QModelIndex top = this->index(0, 0);
+    emit dataChanged(top, top);
+}
+
+void TreeModel::addVirtualUser(const QByteArray &name, const QByteArray &password)
+{
+    m_config->accounts().addVirtualUser(name, password);
+    m_unsaved = true;
+    rebuild();
+}
+
+void TreeModel::changeVirtualUser(const QByteArray &oldName, const QByteArray &newName, const QByteArray &password)
+{
+    m_config->accounts().changeVirtualUser(oldName, newName, password);
+    m_unsaved = true;
+    rebuild();
+}
+
+QString TreeModel::userName(const QModelIndex &index) const
+{
+    return index.isValid() ? itemOf(index)->label : QString();
+}
+
+bool TreeModel::isUserRow(const QModelIndex &index) const
+{
+    return index.isValid() && itemOf(index)->kind != Item::Kind::Group;
+}
+
+bool TreeModel::isGroupName(const QString &name) const
+{
+    const AppStrings &strings = AppStrings::instance();
+    return name == strings.everybody || name == strings.localUsers || name == strings.virtualUsers
+        || name == strings.anonymousUsers;
+}
+
+bool TreeModel::isInVirtualGroup(const QModelIndex &index) const
+{
+    return index.isValid() && itemOf(index)->parent == m_virtualUsers;
+}
+
+QModelIndex TreeModel::indexOfUser(const QString &name, int column) const
+{
+    for (const Item *group : {m_localUsers, m_virtualUsers, m_localUsers->parent}) {
+        for (const auto &child : group->children) {
+            if (child->kind != Item::Kind::Group && child->label == name)
+                return createIndex(child->row, column, child.get());
+        }
+    }
+    return {};
+}
+
+std::optional<AccessFailure> TreeModel::failure(const QModelIndex &index) const
+{
+    if (!isUserRow(index))
+        return std::nullopt;
+    Item &item = *itemOf(index);
+    compute(item);
+    return item.failure;
+}
+
+std::optional<UserForecast> TreeModel::forecast(const QModelIndex &index) const
+{
+    if (!isUserRow(index))
+        return std::nullopt;
+    return forecastOf(*itemOf(index));
+}
+
+void TreeModel::onSave()
+{
+    m_config->save();
+    m_unsaved = false;
+    m_config->setModified(false);
+    // A save changes what it must (the userlist is always enabled).
+    refreshAllUsers();
+}
+
+void TreeModel::markChanged()
+{
+    m_unsaved = true;
+    m_config->setModified(true);
+    refreshAllUsers();
+}
+
+void TreeModel::refreshAllUsers()
+{
+    m_forecast.reset();
+    const int last = columnCount() - 1;
+    for (Item *group : {m_localUsers, m_virtualUsers, m_localUsers->parent}) {
+        for (const auto &child : group->children)
+            child->computed = false;
+        if (!group->children.empty()) {
+            emit dataChanged(createIndex(0, 0, group->children.front().get()),
+                             createIndex(group->children.back()->row, last, group->children.back().get()));
+        }
+    }
+    emit engineChanged();
+}
+
+void TreeModel::invalidData(const QString &reason)
+{
+    if (reason.isEmpty()) {
+        m_interaction.show({Interaction::Icon::Warning, QString(),
+                            tr("Unable to set data. Data is invalid. Reason is unknown"), QString(), QString()});
+    } else {
+        m_interaction.show(
+            {Interaction::Icon::Warning, QString(), tr("Unable to set data. Data is invalid."), QString(), reason});
+    }
+}
+
+bool TreeModel::setStatus(Item &item, bool allowed)
+{
+    if (item.kind == Item::Kind::Anonymous) {
+        m_config->setOption("anonymous_enable", allowed ? "yes" : "no");
+        return true;
+    }
+    const auto refuse = [this](const AccessFailure &failure) {
+        m_interaction.show({Interaction::Icon::Warning, QString(), tr("Unable to change access status."),
+                            tr("Failed check type: ") + failureKindText(failure.kind), failure.message});
+        return false;
+    };
+    if (allowed) {
+        AccessFailure failure;
+        if (!m_config->checkAccess(item.name, true, &failure))
+            return refuse(failure);
+        return true;
+    }
+    m_config->blockUserByUserlist(item.name);
+    if (m_config->checkAccess(item.name, false, nullptr))
+        return refuse(AccessFailure());
+    return true;
+}
+
+bool TreeModel::setDirectory(Item &item, const QString &directory)
+{
+    if (directory.isEmpty() || !directory.startsWith(QLatin1Char('/'))) {
+        invalidData(tr("The directory must be an absolute path."));
+        return false;
+    }
+    const QByteArray path = directory.toLocal8Bit();
+    m_config->checkFolderPermissions(item.name, m_config->userRights(item.name), path);
+    if (!m_config->isChrooted(item.name)) {
+        Interaction::Question question;
+        question.message = {Interaction::Icon::Question, QString(),
+                            tr("This user is not chroot'ed to his home folder.\nDo you want to restrict access "
+                               "outside given folder: %1")
+                                .arg(directory),
+                            QString(), QString()};
+        question.buttons = {Interaction::Button::Yes, Interaction::Button::No};
+        if (m_interaction.ask(question) == Interaction::Button::Yes)
+            m_config->setChrooted(item.name);
+    }
+    if (!m_config->setUserRoot(item.name, path))
+        return false;
+    return true;
+}
+
+bool TreeModel::setMode(Item &item, const QString &rights)
+{
+    m_config->checkFolderPermissions(item.name, rights.split(QStringLiteral(", ")));
+    if (!m_config->setUserRights(item.name, rights)) {
+        m_interaction.show(
+            {Interaction::Icon::Warning, QString(), tr("Unable to change user permissions."), QString(), QString()});
+        return false;
+    }
+    return true;
+}
+
+bool TreeModel::rename(Item &item, const QString &newName)
+{
+    if (newName == item.label)
+        return false;
+    if (item.parent != m_virtualUsers || !m_config->isVirtualUser(item.name)) {
+        m_interaction.show(
+            {Interaction::Icon::Warning, QString(),
+             tr("You can change only virtual user names. Skipping change %1 to %2").arg(item.label, newName), QString(),
+             QString()});
+        return false;
+    }
+    const QByteArray name = newName.toUtf8();
+    if (const auto reason = invalidNameReason(name)) {
+        invalidData(*reason);
+        return false;
+    }
+    if (m_config->isVirtualUser(name) || m_config->accounts().accounts().count(name)) {
+        invalidData(tr("A user named %1 exists already.").arg(newName));
+        return false;
+    }
+    changeVirtualUser(item.name, name, {});
+    emit dataChanged(index(0, 0), index(0, 0));
+    return true;
+}
