@@ -1,7 +1,6 @@
-#include <cstdio>
+#include "Startup.h"
 
-int main()
+int main(int argc, char **argv)
 {
-    std::fputs("ftpconfig: the main window is not built yet; see README.md for the test command.\n", stderr);
-    return 1;
+    return runFtpConfig(argc, argv);
 }
