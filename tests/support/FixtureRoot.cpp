@@ -12,10 +12,10 @@ FixtureRoot::FixtureRoot(const QString &base)
 {
 }
 
-QMap<QString, QByteArray> FixtureRoot::defaults()
+FileMap FixtureRoot::defaults()
 {
     return {
-        {"/etc/passwd",
+        {QStringLiteral("/etc/passwd"),
          "root:x:0:0:root:/root:/bin/bash\n"
          "ftp:x:107:113:ftp daemon:/srv/ftp:/usr/sbin/nologin\n"
          "bob:x:1000:1000:Bob:/home/bob:/bin/bash\n"
@@ -24,7 +24,7 @@ QMap<QString, QByteArray> FixtureRoot::defaults()
          "starred:*:1003:1003::/home/starred:/bin/bash\n"
          "lockedhash:x:1004:1004::/home/lockedhash:/bin/bash\n"
          "doublebang:x:1005:1005::/home/doublebang:/bin/bash\n"},
-        {"/etc/shadow",
+        {QStringLiteral("/etc/shadow"),
          "root:*:19000:0:99999:7:::\n"
          "ftp:*:19000:0:99999:7:::\n"
          "bob:$6$salt$bobhash:19000:0:99999:7:::\n"
@@ -33,11 +33,11 @@ QMap<QString, QByteArray> FixtureRoot::defaults()
          "starred:$6$salt$h:19000:0:99999:7:::\n"
          "lockedhash:!$6$salt$h:19000:0:99999:7:::\n"
          "doublebang:!!:19000:0:99999:7:::\n"},
-        {"/etc/group",
+        {QStringLiteral("/etc/group"),
          "root:x:0:\nftp:x:113:\nbob:x:1000:\nalice:x:1001:\nlocked:x:1002:\nstarred:x:1003:\n"
          "lockedhash:x:1004:\ndoublebang:x:1005:\nftpusers:x:2000:alice\nwriters:x:2001:ftp\n"},
-        {"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\n"},
-        {"/etc/pam.d/vsftpd",
+        {QStringLiteral("/etc/vsftpd.conf"), "listen=YES\nlocal_enable=YES\n"},
+        {QStringLiteral("/etc/pam.d/vsftpd"),
          "# Standard behaviour for ftpd(8).\n"
          "auth\trequired\tpam_listfile.so item=user sense=deny file=/etc/ftpusers onerr=succeed\n"
          "\n"
@@ -45,13 +45,13 @@ QMap<QString, QByteArray> FixtureRoot::defaults()
          "@include common-session\n"
          "@include common-auth\n"
          "auth\trequired\tpam_shells.so\n"},
-        {"/etc/ftpusers", "# /etc/ftpusers: list of users disallowed FTP access.\n\nroot\n"},
+        {QStringLiteral("/etc/ftpusers"), "# /etc/ftpusers: list of users disallowed FTP access.\n\nroot\n"},
     };
 }
 
-bool FixtureRoot::write(const QMap<QString, QByteArray> &files)
+bool FixtureRoot::write(const FileMap &files)
 {
-    QMap<QString, QByteArray> all = defaults();
+    FileMap all = defaults();
     for (auto it = files.begin(); it != files.end(); ++it)
         all[it.key()] = it.value();
     for (auto it = all.begin(); it != all.end(); ++it) {

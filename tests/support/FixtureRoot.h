@@ -6,6 +6,9 @@
 #include <QMap>
 #include <QString>
 
+// Files of a root by the absolute paths the program knows them by.
+using FileMap = QMap<QString, QByteArray>;
+
 // A temporary root with a small Debian-like system:
 //   root, ftp (home /srv/ftp), bob and alice with hashes, locked ("!" in
 //   shadow), starred ("*" in passwd), lockedhash ("!$6$..."), doublebang
@@ -19,9 +22,9 @@ public:
 
     // Writes the default files, overridden by the given ones ("path" ->
     // content; a null QByteArray leaves a default file out).
-    bool write(const QMap<QString, QByteArray> &files = {});
+    bool write(const FileMap &files = {});
     // Virtual users (name -> password) written with db5.3_load.
     bool writeVirtualUsers(const QString &path, const QMap<QByteArray, QByteArray> &users);
 
-    static QMap<QString, QByteArray> defaults();
+    static FileMap defaults();
 };

@@ -1,5 +1,7 @@
 #include "ScriptedInteraction.h"
 
+#include <QMap>
+
 void ScriptedInteraction::show(const Message &message)
 {
     records.append({QStringLiteral("show"), message, {}, {}, {}});
@@ -52,6 +54,33 @@ Interaction::PamChoice ScriptedInteraction::askPamProblem()
 void ScriptedInteraction::exitProcess(int status)
 {
     throw ProcessExit{status};
+}
+
+bool ScriptedInteraction::script(const QStringList &words)
+{
+    static const QMap<QString, Button> buttons{{QStringLiteral("yes"), Button::Yes},
+                                               {QStringLiteral("no"), Button::No},
+                                               {QStringLiteral("ok"), Button::Ok},
+                                               {QStringLiteral("cancel"), Button::Cancel},
+                                               {QStringLiteral("accept"), Button::Accept}};
+    static const QMap<QString, PamChoice> choices{{QStringLiteral("pam:skip"), PamChoice::Skip},
+                                                  {QStringLiteral("pam:valid"), PamChoice::Valid},
+                                                  {QStringLiteral("pam:fix"), PamChoice::Fix}};
+    for (const QString &word : words) {
+        const QString rest = word.section(QLatin1Char(':'), 1);
+        const std::optional<QString> named = rest.isEmpty() ? std::nullopt : std::optional<QString>(rest);
+        if (buttons.contains(word))
+            answers << buttons.value(word);
+        else if (choices.contains(word))
+            pamChoices << choices.value(word);
+        else if (word.startsWith(QLatin1String("owner:")))
+            owners << named;
+        else if (word.startsWith(QLatin1String("path:")))
+            paths << named;
+        else
+            return false;
+    }
+    return true;
 }
 
 QStringList ScriptedInteraction::texts() const

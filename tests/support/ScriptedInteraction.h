@@ -38,6 +38,11 @@ public:
     PamChoice askPamProblem() override;
     [[noreturn]] void exitProcess(int status) override;
 
+    // Queues answers given as words: "yes", "no", "ok", "cancel", "accept",
+    // "owner:NAME", "path:PATH" (nothing after the colon: cancelled),
+    // "pam:skip", "pam:valid", "pam:fix". False at a word it does not know.
+    bool script(const QStringList &words);
+
     // "title|text|informative|detailed" of every box and question, in order.
     QStringList texts() const;
     bool allAnswersUsed() const;
