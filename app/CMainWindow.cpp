@@ -1,0 +1,452 @@
+#include "CMainWindow.h"
+
+#include "LoginCheckDock.h"
+#include "Server.h"
+#include "VexHelpMenu.h"
+#include "VexIcon.h"
+#include "dialogs/GuiInteraction.h"
+#include "policy/FtpServerConfig.h"
+#include "ui_CMainWindow.h"
+#include "usertable/CMainTreeView.h"
+#include "usertable/CUsersFilterProxyModel.h"
+#include "usertable/TreeModel.h"
+
+#include <QCloseEvent>
+#include <QCursor>
+#include <QDebug>
+#include <QDialogButtonBox>
+#include <QHeaderView>
+#include <QLabel>
+#include <QMenu>
+#include <QMessageBox>
+#include <QPixmap>
+#include <QPushButton>
+#include <QSettings>
+#include <QStatusBar>
+
+#include <cstdio>
+#include <exception>
+
+namespace {
+
+const QString widthKey = QStringLiteral("MW/width");
+const QString heightKey = QStringLiteral("MW/height");
+const QString toolbarsKey = QStringLiteral("MW/toolbars");
+const QString toolbarOrientationKey = QStringLiteral("MW/toolbar_Orientation");
+const QString treeHeaderStateKey = QStringLiteral("MW/treeHeaderState");
+
+QIcon themeIcon(const char *name, const char *fallback)
+{
+    return QIcon::fromTheme(QLatin1String(name), QIcon(QPixmap(QLatin1String(fallback))));
+}
+
+QIcon startIcon()
+{
+    return themeIcon("media-playback-start", ":/prefix/icons/pixel/start.png");
+}
+
+QIcon stopIcon()
+{
+    return themeIcon("media-playback-stop", ":/prefix/icons/pixel/stop.png");
+}
+
+} // namespace
+
+CMainWindow::CMainWindow(QWidget *parent)
+    : CMainWindow(Server::instance(), parent)
+{
+}
+
+CMainWindow::CMainWindow(Server &server, QWidget *parent)
+    : QMainWindow(parent)
+    , m_ui(std::make_unique<Ui::CMainWindow>())
+    , m_server(server)
+{
+    try {
+        build();
+    } catch (const std::exception &error) {
+        QMessageBox box(QMessageBox::Critical, windowTitle(), QString::fromLocal8Bit(error.what()), QMessageBox::Ok,
+                        this);
+        box.exec();
+        close();
+        // Start-up shows the window after this; it must not stay open
+        // over a configuration it could not load.
+        QMetaObject::invokeMethod(this, &QWidget::close, Qt::QueuedConnection);
+    }
+}
+
+CMainWindow::~CMainWindow()
+{
+    // The model's engine talks through the interaction to the end: the
+    // views and the model go first.
+    if (m_view) {
+        disconnect(m_view, nullptr, this, nullptr);
+        m_view->setModel(nullptr);
+    }
+    delete m_loginCheckDock;
+    delete m_proxy;
+    delete m_model;
+}
+
+void CMainWindow::build()
+{
+    m_ui->setupUi(this);
+
+    m_statusLabel
+        = new QLabel(tr("There are unsaved changes. To apply them, click \"Save\" button on the toolbar"), this);
+    m_statusLabel->setObjectName(QStringLiteral("unsavedChangesLabel"));
+    m_statusLabel->setStyleSheet(QStringLiteral("font-weight: bold;"));
+    m_statusLabel->hide();
+
+    auto *helpMenu = new VexHelpMenu(this);
+    menuBar()->addMenu(helpMenu);
+    setActionIcons();
+
+    // Made before the window state is restored, which places it.
+    m_loginCheckDock = new LoginCheckDock(this);
+    addDockWidget(Qt::BottomDockWidgetArea, m_loginCheckDock);
+    auto *viewMenu = new QMenu(tr("View"), this);
+    viewMenu->setObjectName(QStringLiteral("viewMenu"));
+    viewMenu->addAction(m_loginCheckDock->toggleViewAction());
+    menuBar()->insertMenu(helpMenu->menuAction(), viewMenu);
+
+    restoreWindowState();
+
+    const QStringList titles{tr("users"), tr("status"), tr("directory"), tr("mode"), tr("server")};
+    m_interaction = std::make_unique<GuiInteraction>();
+    m_model = new TreeModel(titles, *m_interaction, this);
+
+    m_view = new CMainTreeView(this);
+    setCentralWidget(m_view);
+    m_proxy = new CUsersFilterProxyModel(&m_model->config(), this);
+    m_proxy->setSourceModel(m_model);
+    m_view->setModel(m_proxy);
+    m_loginCheckDock->setModel(m_model);
+
+    m_view->setContextMenuPolicy(Qt::CustomContextMenu);
+    connect(m_view, &QWidget::customContextMenuRequested, this, &CMainWindow::contextMenuRequested);
+
+    connect(m_ui->actionSave, &QAction::triggered, m_model, &TreeModel::onSave);
+
+    updateStartStopAction(m_server.running());
+    connect(m_ui->actionStartStopService, &QAction::triggered, this, &CMainWindow::startStopService);
+    connect(&m_server, &Server::runningChanged, this, &CMainWindow::updateStartStopAction);
+
+    installDelegates();
+    createFilterMenu();
+    connectActions();
+
+    m_view->expandAll();
+
+    const QByteArray headerState = QSettings().value(treeHeaderStateKey).toByteArray();
+    if (headerState.isEmpty()) {
+        for (int column = 0; column < m_model->columnCount(); ++column)
+            m_view->resizeColumnToContents(column);
+        // First run: the table keeps the larger part of the window.
+        resizeDocks({m_loginCheckDock}, {height() / 3}, Qt::Vertical);
+    } else {
+        m_view->header()->restoreState(headerState);
+    }
+
+    viewElementActivated(m_view->currentIndex());
+    connect(m_model, &QAbstractItemModel::dataChanged, this, &CMainWindow::onDataChanged);
+    // The saved state changes with every edit, including those that touch
+    // no cell (a removal, the options).
+    connect(m_model, &TreeModel::engineChanged, this, &CMainWindow::onDataChanged);
+    onDataChanged();
+    m_built = true;
+}
+
+void CMainWindow::setActionIcons()
+{
+    m_ui->actionStartStopService->setIcon(startIcon());
+    m_ui->actionSave->setIcon(themeIcon("document-save", ":/prefix/icons/pixel/save.png"));
+    m_ui->actionExit->setIcon(themeIcon("application-exit", ":/prefix/icons/exit.png"));
+    m_ui->actionOptions->setIcon(themeIcon("configure", ":/prefix/icons/option_item.png"));
+    m_ui->actionAdd_user->setIcon(themeIcon("list-add-user", ":/prefix/icons/pixel/adduser.png"));
+    m_ui->actionDelete_user->setIcon(themeIcon("list-remove-user", ":/prefix/icons/pixel/deleteuser.png"));
+    m_ui->actionEdit_user->setIcon(themeIcon("user-properties", ":/prefix/icons/pixel/edituser.png"));
+}
+
+void CMainWindow::restoreWindowState()
+{
+    QSettings settings;
+    resize(settings.value(widthKey, 640).toInt(), settings.value(heightKey, 480).toInt());
+    const QByteArray state = settings.value(toolbarsKey).toByteArray();
+    if (!state.isNull())
+        restoreState(state, 0);
+    const int orientation = settings.value(toolbarOrientationKey, int(Qt::Horizontal)).toInt();
+    m_ui->toolBar->setOrientation(orientation == int(Qt::Vertical) ? Qt::Vertical : Qt::Horizontal);
+}
+
+void CMainWindow::installDelegates()
+{
+    // The cell editors of the status, directory and mode columns
+    // (CUsermodeDelegate, CDirSelectorDelegate, CPermissionDelegate) are
+    // installed here with setItemDelegateForColumn; until they exist the
+    // view edits those cells with its default line editor.
+}
+
+void CMainWindow::createFilterMenu()
+{
+    m_filterMenu = new QMenu(tr("Filter users"), this);
+    m_filterMenu->setObjectName(QStringLiteral("filterMenu"));
+
+    m_hideSystemUsersAction
+        = m_filterMenu->addAction(VexIcon::fromTheme(QStringLiteral("user"), QStringLiteral("emblem-system"),
+                                                     QIcon(QPixmap(QStringLiteral(":/prefix/icons/user_gray.png")))),
+                                  tr("Hide system users"));
+    m_hideSystemUsersAction->setObjectName(QStringLiteral("hideSystemUsersAction"));
+    m_hideSystemUsersAction->setCheckable(true);
+    // Checked before it is connected: the proxy shows system users until
+    // the item is toggled.
+    m_hideSystemUsersAction->setChecked(true);
+    connect(m_hideSystemUsersAction, &QAction::toggled, this, &CMainWindow::toggleSystemUsers);
+
+    m_hideDeniedUsersAction
+        = m_filterMenu->addAction(VexIcon::fromTheme(QStringLiteral("user"), QStringLiteral("emblem-unreadable"),
+                                                     QIcon(QPixmap(QStringLiteral(":/prefix/icons/user_red.png")))),
+                                  tr("Hide denied users"));
+    m_hideDeniedUsersAction->setObjectName(QStringLiteral("hideDeniedUsersAction"));
+    m_hideDeniedUsersAction->setCheckable(true);
+    connect(m_hideDeniedUsersAction, &QAction::toggled, this, &CMainWindow::toggleDeniedUsers);
+
+    m_hideAllowedUsersAction = m_filterMenu->addAction(
+        QIcon::fromTheme(QStringLiteral("user"), QIcon(QPixmap(QStringLiteral(":/prefix/icons/user_green.png")))),
+        tr("Hide allowed users"));
+    m_hideAllowedUsersAction->setObjectName(QStringLiteral("hideAllowedUsersAction"));
+    m_hideAllowedUsersAction->setCheckable(true);
+    connect(m_hideAllowedUsersAction, &QAction::toggled, this, &CMainWindow::toggleAllowedUsers);
+
+    m_filterMenu->addSeparator();
+    m_filterMenu->addAction(m_ui->actionAdd_user);
+    m_filterMenu->addAction(m_ui->actionEdit_user);
+    m_filterMenu->addAction(m_ui->actionDelete_user);
+}
+
+void CMainWindow::connectActions()
+{
+    connect(m_ui->actionAdd_user, &QAction::triggered, this, &CMainWindow::addUser);
+    connect(m_ui->actionDelete_user, &QAction::triggered, this, &CMainWindow::deleteUser);
+    connect(m_ui->actionEdit_user, &QAction::triggered, this, &CMainWindow::editUser);
+    connect(m_ui->actionExit, &QAction::triggered, this, &CMainWindow::exit);
+    connect(m_ui->actionOptions, &QAction::triggered, this, &CMainWindow::showSettingsDialog);
+    connect(m_view, &CMainTreeView::selected, this, &CMainWindow::viewElementActivated);
+
+    // Neither the virtual user dialogs nor the options dialog are part of
+    // the program yet: their actions say so instead of doing nothing.
+    const QString missing = tr("Not available in this version");
+    for (QAction *action : {m_ui->actionAdd_user, m_ui->actionEdit_user, m_ui->actionOptions}) {
+        action->setEnabled(false);
+        action->setToolTip(missing);
+    }
+}
+
+TreeModel *CMainWindow::model() const
+{
+    return m_model;
+}
+
+CUsersFilterProxyModel *CMainWindow::proxy() const
+{
+    return m_proxy;
+}
+
+CMainTreeView *CMainWindow::view() const
+{
+    return m_view;
+}
+
+LoginCheckDock *CMainWindow::loginCheckDock() const
+{
+    return m_loginCheckDock;
+}
+
+void CMainWindow::startStopService()
+{
+    const bool running = m_ui->actionStartStopService->data().toBool();
+    if (running) {
+        if (!m_server.stop()) {
+            QMessageBox box(QMessageBox::NoIcon, windowTitle(),
+                            tr("Failed to stop vsftpd.") + QLatin1Char('\n') + m_server.lastError(), QMessageBox::Ok,
+                            this);
+            box.exec();
+        }
+        return;
+    }
+    if (m_model && m_model->hasUnsavedChanges()) {
+        const auto answer = QMessageBox::warning(
+            this, windowTitle(), tr("You have unsaved changes. Do you want to save them before service start?"),
+            QMessageBox::Yes | QMessageBox::No | QMessageBox::Cancel);
+        if (answer == QMessageBox::Cancel)
+            return;
+        if (answer == QMessageBox::Yes)
+            m_model->onSave();
+    }
+    if (!m_server.start()) {
+        QMessageBox box(QMessageBox::NoIcon, windowTitle(),
+                        tr("Failed to start vsftpd.") + QLatin1Char('\n') + m_server.lastError(), QMessageBox::Ok,
+                        this);
+        box.exec();
+    }
+}
+
+void CMainWindow::contextMenuRequested(const QPoint &pos)
+{
+    Q_UNUSED(pos)
+    m_filterMenu->popup(QCursor::pos());
+}
+
+void CMainWindow::toggleSystemUsers(bool hide)
+{
+    refilterKeepingCurrent(&CUsersFilterProxyModel::setHideSystemUsers, hide);
+}
+
+void CMainWindow::toggleDeniedUsers(bool hide)
+{
+    refilterKeepingCurrent(&CUsersFilterProxyModel::setHideDeniedUsers, hide);
+}
+
+void CMainWindow::toggleAllowedUsers(bool hide)
+{
+    refilterKeepingCurrent(&CUsersFilterProxyModel::setHideAllowedUsers, hide);
+}
+
+void CMainWindow::refilterKeepingCurrent(void (CUsersFilterProxyModel::*setHidden)(bool), bool hide)
+{
+    const QPersistentModelIndex current = currentSourceIndex();
+    (m_proxy->*setHidden)(hide);
+    m_view->expandAll();
+    m_view->setCurrentIndex(m_proxy->mapFromSource(current));
+}
+
+QModelIndex CMainWindow::currentSourceIndex() const
+{
+    return m_proxy->mapToSource(m_view->currentIndex());
+}
+
+void CMainWindow::addUser()
+{
+    // Entry point of the "new virtual user" dialog; the action stays
+    // disabled until the dialog exists.
+}
+
+void CMainWindow::editUser()
+{
+    // Entry point of the "edit virtual user" dialog; the action stays
+    // disabled until the dialog exists.
+}
+
+void CMainWindow::deleteUser()
+{
+    const QModelIndex current = m_view->currentIndex();
+    auto *proxy = qobject_cast<QSortFilterProxyModel *>(m_view->model());
+    if (current.isValid() && !proxy) {
+        std::fputs("Internal error: view model is not proxy model.\n", stderr);
+        return;
+    }
+    const QModelIndex source = current.isValid() ? proxy->mapToSource(current) : QModelIndex();
+    // The shortcut reaches here whatever the row: only a virtual user goes.
+    if (!m_model->isInVirtualGroup(source)) {
+        QMessageBox::warning(this, windowTitle(), tr("Please, select virtual user which has to be changed."));
+        return;
+    }
+    QMessageBox question(QMessageBox::Warning, tr("Deleting user"),
+                         tr("Are you sure you want to delete virtual user %1?").arg(m_model->userName(source)),
+                         QMessageBox::Ok | QMessageBox::Cancel, this);
+    question.setDefaultButton(QMessageBox::Cancel);
+    if (question.exec() == QMessageBox::Cancel)
+        return;
+    m_model->removeVirtualUser(source);
+    m_view->expandAll();
+    viewElementActivated(m_view->currentIndex());
+}
+
+void CMainWindow::viewElementActivated(const QModelIndex &index)
+{
+    const QModelIndex source = m_proxy->mapToSource(index);
+    const QString name = m_model->userName(source);
+    const bool virtualUser = source.isValid() && !m_model->isGroupName(name) && m_model->isInVirtualGroup(source)
+        && m_model->config().isVirtualUser(name.toUtf8());
+    m_ui->actionDelete_user->setVisible(virtualUser);
+    m_ui->actionEdit_user->setVisible(virtualUser);
+    m_loginCheckDock->showUser(source);
+}
+
+void CMainWindow::exit()
+{
+    close();
+}
+
+void CMainWindow::showSettingsDialog()
+{
+    // The options dialog goes here: load, exec, and on acceptance store
+    // into the engine, rebuild the model, re-filter, expand, mark unsaved
+    // and onDataChanged(). Until it exists the action stays disabled and
+    // nothing is opened.
+}
+
+void CMainWindow::onDataChanged()
+{
+    const bool unsaved = m_model->hasUnsavedChanges();
+    m_ui->actionSave->setEnabled(unsaved);
+    if (unsaved) {
+        statusBar()->addWidget(m_statusLabel);
+        m_statusLabel->show();
+    } else {
+        statusBar()->removeWidget(m_statusLabel);
+    }
+}
+
+void CMainWindow::enableVirtualUserOkButton()
+{
+    if (!m_virtualUserButtonBox)
+        return;
+    if (QPushButton *ok = m_virtualUserButtonBox->button(QDialogButtonBox::Ok))
+        ok->setEnabled(true);
+}
+
+void CMainWindow::updateStartStopAction(bool running)
+{
+    qCritical() << "void CMainWindow::updateStartStopAction(bool)" << running;
+    QAction *action = m_ui->actionStartStopService;
+    action->setData(running);
+    const QString text = running ? tr("Stop FTP service") : tr("Start FTP service");
+    action->setIcon(running ? stopIcon() : startIcon());
+    action->setText(text);
+    action->setToolTip(text);
+}
+
+void CMainWindow::closeEvent(QCloseEvent *event)
+{
+    // Construction failed: there is nothing to save, and the window's
+    // state is not worth keeping.
+    if (!m_built) {
+        event->accept();
+        return;
+    }
+    if (m_model->hasUnsavedChanges()) {
+        const auto answer = QMessageBox::question(this, windowTitle(), tr("Do you want to save changes?"),
+                                                  QMessageBox::Yes | QMessageBox::No | QMessageBox::Cancel);
+        if (answer == QMessageBox::Cancel) {
+            event->ignore();
+            return;
+        }
+        event->accept();
+        if (answer == QMessageBox::Yes)
+            m_model->onSave();
+    } else {
+        event->accept();
+    }
+    writeSettings();
+}
+
+void CMainWindow::writeSettings()
+{
+    QSettings settings;
+    settings.setValue(widthKey, geometry().width());
+    settings.setValue(heightKey, geometry().height());
+    settings.setValue(toolbarsKey, saveState(0));
+    settings.setValue(toolbarOrientationKey, int(m_ui->toolBar->orientation()));
+    settings.setValue(treeHeaderStateKey, m_view->header()->saveState());
+}
