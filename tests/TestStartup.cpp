@@ -25,13 +25,6 @@ const QByteArray shown = "ftpconfig.startup: main window shown";
 const QByteArray activated = "ftpconfig.instance: window brought to the front";
 const QByteArray refusing = "ftpconfig.startup: refusing the real user id 65534";
 
-QStringList asNobody(const QStringList &command)
-{
-    return QStringList{QStringLiteral("--reuid=65534"), QStringLiteral("--regid=65534"),
-                       QStringLiteral("--clear-groups")}
-    + command;
-}
-
 // A socket file nobody listens on, as a crashed instance leaves it.
 bool leaveStaleSocket(const QString &path)
 {
@@ -67,9 +60,11 @@ private Q_SLOTS:
 
 private:
     int activations() const;
+    QStringList asNobody(const QStringList &command) const;
     void startFirst();
 
     QTemporaryDir m_config;
+    QTemporaryDir m_nobodyRuntime;
     FixtureRoot m_root;
     QString m_serverName;
     QProcess m_first;
@@ -83,6 +78,9 @@ void TestStartup::initTestCase()
         QSKIP("starts the program as root and as nobody: run as root");
     QVERIFY(QFileInfo(program).isExecutable());
     QVERIFY(m_config.isValid());
+    // Qt would otherwise make and leave /tmp/runtime-nobody.
+    QVERIFY(m_nobodyRuntime.isValid());
+    QVERIFY(::chown(QFile::encodeName(m_nobodyRuntime.path()).constData(), 65534, 65534) == 0);
     QVERIFY(m_root.write());
     // Started processes keep their settings here; the PAM question is
     // answered for good, so that the window comes up without a dialog.
@@ -136,6 +134,15 @@ void TestStartup::cleanup()
 {
     for (QWidget *widget : QApplication::topLevelWidgets())
         QVERIFY2(!widget->isVisible(), qPrintable(widget->windowTitle() + QLatin1Char(' ') + widget->objectName()));
+}
+
+// The command as user and group 65534 without supplementary groups.
+QStringList TestStartup::asNobody(const QStringList &command) const
+{
+    return QStringList{QStringLiteral("--reuid=65534"), QStringLiteral("--regid=65534"),
+                       QStringLiteral("--clear-groups"), QStringLiteral("env"),
+                       QStringLiteral("XDG_RUNTIME_DIR=") + m_nobodyRuntime.path()}
+    + command;
 }
 
 int TestStartup::activations() const
