@@ -51,6 +51,7 @@ AccountStore::AccountStore(const QByteArray &databasePath, const RootDirectory &
     loadPasswd();
     loadShadow();
     loadGroups();
+    buildIndexes();
     if (!databasePath.isEmpty())
         loadVirtualUsers(databasePath);
 }
@@ -97,6 +98,22 @@ void AccountStore::loadGroups()
         m_groups.emplace(record.gid, std::move(record));
     }
     std::fclose(file);
+}
+
+void AccountStore::buildIndexes()
+{
+    // Maps iterate in key order: the first entry kept for a key is the one
+    // a scan in that order would have found.
+    for (const auto &[gid, group] : m_groups) {
+        for (const QByteArray &member : group.members)
+            m_supplementaryGroups[member].append(group.name);
+        if (!m_groupIds.contains(group.name))
+            m_groupIds.insert(group.name, gid);
+    }
+    for (const auto &[name, record] : m_passwd) {
+        if (!m_userNames.contains(record.uid))
+            m_userNames.insert(record.uid, name);
+    }
 }
 
 bool AccountStore::getUserInfo(const QByteArray &name, AccountRecord &record) const
@@ -155,11 +172,7 @@ bool AccountStore::isBadPassword(const QByteArray &name) const
 
 QList<QByteArray> AccountStore::userGroups(const QByteArray &name) const
 {
-    QList<QByteArray> result;
-    for (const auto &[gid, group] : m_groups) {
-        if (group.members.count(name))
-            result.append(group.name);
-    }
+    QList<QByteArray> result = m_supplementaryGroups.value(name);
     const auto account = m_passwd.find(name);
     if (account == m_passwd.end())
         return result;
@@ -180,11 +193,13 @@ bool AccountStore::isUserInGroup(const QByteArray &name, const QByteArray &group
 
 int AccountStore::groupIdByName(const QByteArray &groupName) const
 {
-    for (const auto &[gid, group] : m_groups) {
-        if (group.name == groupName)
-            return static_cast<int>(gid);
-    }
-    return -1;
+    const auto it = m_groupIds.find(groupName);
+    return it == m_groupIds.end() ? -1 : static_cast<int>(*it);
+}
+
+QByteArray AccountStore::userNameById(uint32_t uid) const
+{
+    return m_userNames.value(uid);
 }
 
 const std::map<QByteArray, AccountRecord> &AccountStore::accounts() const

@@ -4,6 +4,7 @@
 #include "common/RootDirectory.h"
 
 #include <QByteArray>
+#include <QHash>
 #include <QList>
 #include <QString>
 
@@ -53,7 +54,10 @@ public:
     // Supplementary groups in gid order, then the primary group.
     QList<QByteArray> userGroups(const QByteArray &name) const;
     bool isUserInGroup(const QByteArray &name, const QByteArray &groupName) const;
+    // The lowest gid of that name; -1 when no group has it.
     int groupIdByName(const QByteArray &groupName) const;
+    // The first account in name order with that uid; empty when none has it.
+    QByteArray userNameById(uint32_t uid) const;
 
     const std::map<QByteArray, AccountRecord> &accounts() const;
     const std::map<QByteArray, AccountRecord> &shadow() const;
@@ -81,6 +85,7 @@ private:
     void loadPasswd();
     void loadShadow();
     void loadGroups();
+    void buildIndexes();
 
     uint32_t firstUserId() const;
 
@@ -90,6 +95,12 @@ private:
     std::map<QByteArray, AccountRecord> m_passwd;
     std::map<QByteArray, AccountRecord> m_shadow;
     std::map<uint32_t, GroupRecord> m_groups;
+    // Built once after loading: every user of the table is looked up in
+    // them, and scanning all groups or accounts per user grows with the
+    // square of the machine's size.
+    QHash<QByteArray, QList<QByteArray>> m_supplementaryGroups; // in gid order
+    QHash<QByteArray, uint32_t> m_groupIds;
+    QHash<uint32_t, QByteArray> m_userNames;
     std::map<QByteArray, VirtualUserRecord> m_virtualUsers;
     QByteArray m_databasePath;
     std::unique_ptr<VirtualUserDb> m_db;

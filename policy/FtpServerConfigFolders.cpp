@@ -82,13 +82,7 @@ void FtpServerConfig::checkFolderPermissions(const QByteArray &user, const QStri
             QString(), tr("Unable to get groups in which user participates in. Username: %1").arg(text(account)));
         return;
     }
-    QByteArray ownerName;
-    for (const auto &entry : m_accounts->accounts()) {
-        if (entry.second.uid == info.st_uid) {
-            ownerName = entry.first;
-            break;
-        }
-    }
+    QByteArray ownerName = m_accounts->userNameById(info.st_uid);
     QByteArray groupName;
     const auto group = m_accounts->groups().find(info.st_gid);
     if (group != m_accounts->groups().end())
