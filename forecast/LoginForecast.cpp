@@ -19,12 +19,20 @@ QString text(const QByteArray &bytes)
     return QString::fromUtf8(bytes);
 }
 
-std::optional<QList<QByteArray>> readLines(const QString &path)
+// The lines of a list file, read once: each login is compared with whole
+// lines, case-sensitively, a "\r" before the line end not counted.
+std::optional<QSet<QByteArray>> readNames(const QString &path)
 {
     QFile file(path);
     if (!QFileInfo(path).isFile() || !file.open(QIODevice::ReadOnly))
         return std::nullopt;
-    return file.readAll().split('\n');
+    QSet<QByteArray> names;
+    for (QByteArray line : file.readAll().split('\n')) {
+        if (line.endsWith('\r'))
+            line.chop(1);
+        names.insert(line);
+    }
+    return names;
 }
 
 } // namespace
@@ -143,7 +151,7 @@ void LoginForecast::checkServer()
     }
     if (m_settings.isYes("userlist_enable", false)) {
         m_userlistFile = m_settings.value("userlist_file", "/etc/vsftpd.user_list");
-        m_userlist = readLines(root.resolve(text(m_userlistFile)));
+        m_userlist = readNames(root.resolve(text(m_userlistFile)));
         if (!m_userlist) {
             error(m_mainPath, m_settings.line("userlist_file"),
                   QStringLiteral("userlist_enable is on, but %1 cannot be read: vsftpd ends every connection")
@@ -152,7 +160,7 @@ void LoginForecast::checkServer()
     }
     m_chrootListFile = m_settings.value("chroot_list_file", "/etc/vsftpd.chroot_list");
     if (m_settings.isYes("chroot_list_enable", false))
-        m_chrootList = readLines(root.resolve(text(m_chrootListFile)));
+        m_chrootList = readNames(root.resolve(text(m_chrootListFile)));
 
     // The PAM service the server uses: the last pam_service_name, which is
     // the one the engine loaded unless the key is repeated.
@@ -173,15 +181,7 @@ void LoginForecast::checkServer()
 
 bool LoginForecast::isListed(const QByteArray &login) const
 {
-    if (!m_userlist)
-        return false;
-    for (QByteArray line : *m_userlist) {
-        if (line.endsWith('\r'))
-            line.chop(1);
-        if (line == login)
-            return true;
-    }
-    return false;
+    return m_userlist && m_userlist->contains(login);
 }
 
 const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
@@ -399,13 +399,7 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
                                            "ends every local login")
                                 .arg(text(m_chrootListFile)));
             }
-            bool listed = false;
-            for (QByteArray line : *m_chrootList) {
-                if (line.endsWith('\r'))
-                    line.chop(1);
-                listed = listed || line == login;
-            }
-            if (listed)
+            if (m_chrootList->contains(login))
                 chrooted = !chrooted;
         }
     }

@@ -6,6 +6,7 @@
 #include <QByteArray>
 #include <QDate>
 #include <QList>
+#include <QSet>
 #include <QString>
 
 #include <map>
@@ -69,9 +70,9 @@ private:
     QList<ForecastFinding> m_serverFindings;
     bool m_serverFails = false;
     QByteArray m_userlistFile;
-    std::optional<QList<QByteArray>> m_userlist;
+    std::optional<QSet<QByteArray>> m_userlist;
     QByteArray m_chrootListFile;
-    std::optional<QList<QByteArray>> m_chrootList;
+    std::optional<QSet<QByteArray>> m_chrootList;
     std::unique_ptr<ConfigFile> m_ownPam; // when the server's service is another
     std::unique_ptr<PamForecast> m_pam;
     std::map<QByteArray, std::unique_ptr<VsftpdSettings>> m_userFiles;

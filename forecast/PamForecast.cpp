@@ -294,18 +294,20 @@ PamForecast::ModuleAnswer PamForecast::runListfile(const Line &line, const QByte
     }
     if (sense != "allow" && sense != "deny")
         return onError(QStringLiteral("sense=%1 is neither allow nor deny").arg(QString::fromUtf8(sense)));
-    QFile list(resolved(QString::fromUtf8(file)));
-    if (file.isEmpty() || !QFileInfo(list).isFile() || !list.open(QIODevice::ReadOnly))
+    const QHash<QByteArray, int> *entries = listEntries(file);
+    if (!entries)
         return onError(QStringLiteral("the list %1 cannot be read").arg(QString::fromUtf8(file)));
+    // The entry named is the first line of the file that matches a
+    // candidate, as a reading from the top finds it.
     bool listed = false;
     QByteArray found;
-    for (QByteArray entry : list.readAll().split('\n')) {
-        if (entry.endsWith('\r'))
-            entry.chop(1);
-        if (!entry.isEmpty() && candidates.contains(entry)) {
+    int foundLine = 0;
+    for (const QByteArray &candidate : candidates) {
+        const auto it = entries->find(candidate);
+        if (it != entries->end() && (!listed || *it < foundLine)) {
             listed = true;
-            found = entry;
-            break;
+            found = candidate;
+            foundLine = *it;
         }
     }
     const QString shownFile = QString::fromUtf8(file);
@@ -319,6 +321,28 @@ PamForecast::ModuleAnswer PamForecast::runListfile(const Line &line, const QByte
     if (listed)
         return {AuthErr, QStringLiteral("%1 is listed in %2 (sense=deny)").arg(QString::fromUtf8(found), shownFile)};
     return {Success, QString()};
+}
+
+const QHash<QByteArray, int> *PamForecast::listEntries(const QByteArray &file)
+{
+    auto it = m_lists.find(file);
+    if (it == m_lists.end()) {
+        std::optional<QHash<QByteArray, int>> entries;
+        QFile list(resolved(QString::fromUtf8(file)));
+        if (!file.isEmpty() && QFileInfo(list).isFile() && list.open(QIODevice::ReadOnly)) {
+            entries.emplace();
+            int line = 0;
+            for (QByteArray entry : list.readAll().split('\n')) {
+                ++line;
+                if (entry.endsWith('\r'))
+                    entry.chop(1);
+                if (!entry.isEmpty() && !entries->contains(entry))
+                    entries->insert(entry, line);
+            }
+        }
+        it = m_lists.emplace(file, std::move(entries)).first;
+    }
+    return it->second ? &*it->second : nullptr;
 }
 
 const QSet<QByteArray> *PamForecast::userdbKeys(const QByteArray &path)

@@ -1,7 +1,7 @@
 #pragma once
 
-#include "config/ConfigFile.h"
 #include "common/RootDirectory.h"
+#include "config/ConfigFile.h"
 
 #include <QByteArray>
 #include <QDate>
@@ -81,6 +81,9 @@ private:
     ModuleAnswer runUnix(const Line &line, const QByteArray &user);
     ModuleAnswer runListfile(const Line &line, const QByteArray &user);
     ModuleAnswer runUserdb(const Line &line, const QByteArray &user);
+    // The entries of a pam_listfile list, each with the line it first
+    // appears on; null when the file cannot be read.
+    const QHash<QByteArray, int> *listEntries(const QByteArray &file);
     const QSet<QByteArray> *userdbKeys(const QByteArray &path);
     std::optional<QList<QByteArray>> shadowFields(const QByteArray &user);
     QString resolved(const QString &path) const;
@@ -92,6 +95,8 @@ private:
     QDate m_today;
     std::map<QString, std::unique_ptr<ConfigFile>> m_included;
     std::map<QByteArray, QList<Line>> m_stacks;
+    // Lists and databases are read once per forecast, not once per user.
+    std::map<QByteArray, std::optional<QHash<QByteArray, int>>> m_lists;
     std::map<QByteArray, std::optional<QSet<QByteArray>>> m_userdbs;
     std::optional<QHash<QByteArray, QList<QByteArray>>> m_shadow;
     std::optional<QSet<QByteArray>> m_shells;
