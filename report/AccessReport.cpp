@@ -59,14 +59,14 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
         ReportRow row;
         row.name = name;
         row.kind = kind;
-        const int problemsBefore = interaction.pamProblems;
         row.allowed = config.checkAccess(name, false, &row.failure);
         row.directory = config.effectiveRoot(name);
         row.rights = rightsText(config.userRights(name));
         row.forecast = forecast.forecast(name);
-        if (!row.allowed && row.failure.message.isEmpty() && interaction.pamProblems > problemsBefore) {
+        if (!row.allowed && row.failure.message.isEmpty() && interaction.pamProblems > 0) {
             // The PAM check refuses without a message of its own when the
-            // PAM file does not start its stacks with pam_userdb.so.
+            // PAM file does not start its stacks with pam_userdb.so; it asks
+            // once and refuses every later virtual user silently.
             row.failure.message = QStringLiteral("PAM configuration problem: the first auth or account line of the "
                                                  "PAM file is not \"sufficient pam_userdb.so\"");
         }
