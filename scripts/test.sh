@@ -10,7 +10,8 @@ scripts/check-format.sh
 scripts/fuzz-config.sh "${FUZZ_SECONDS:-30}"
 
 scripts/build.sh build-asan -DCMAKE_BUILD_TYPE=Debug -DWITH_ASAN=ON -DWITH_TESTS=ON -DWITH_BENCHMARKS=OFF
-(cd build-asan && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 ctest -j2 --output-on-failure)
+(cd build-asan && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 \
+    LSAN_OPTIONS="suppressions=$PWD/../tests/lsan.supp:fast_unwind_on_malloc=0" ctest -j2 --output-on-failure)
 
 scripts/build.sh build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DWITH_TESTS=ON -DWITH_BENCHMARKS=ON
 (cd build && ctest -j2 --output-on-failure)
