@@ -1,21 +1,14 @@
 #include "CaptureStream.h"
-#include "FixtureRoot.h"
-#include "ScriptedInteraction.h"
+#include "EngineFixture.h"
 #include "TestMain.h"
 #include "common/SafeFile.h"
-#include "policy/FtpServerConfig.h"
 
-#include <QDirIterator>
 #include <QStandardPaths>
 #include <QtTest>
 
 #include <iostream>
-#include <memory>
 #include <sys/stat.h>
 #include <unistd.h>
-
-using FileMap = QMap<QString, QByteArray>;
-Q_DECLARE_METATYPE(FileMap)
 
 namespace {
 
@@ -24,61 +17,22 @@ namespace {
 FileMap richFiles()
 {
     return {
-        {"/etc/vsftpd.conf",
+        {QStringLiteral("/etc/vsftpd.conf"),
          "# Example config\nlisten=YES\n      local_enable=YES\nanon_root = /srv/ftp  \n"
          "userlist_file=/etc/vsftpd.d/allowed_user_list.conf\nchroot_list_enable=YES\n\n\n"},
-        {"/etc/vsftpd.d/allowed_user_list.conf", "  carl  \n\nalice\n"},
-        {"/etc/vsftpd.chroot_list", "bob \n"},
-        {"/etc/ftpusers", "# deny\n      root\n"},
-        {"/etc/vsftpd.d/users.d/bob", "# bob\n        local_root=/srv/bob\nwrite_enable=YES"},
-        {"/etc/vsftpd.d/users.d/alice", "download_enable=NO\n"},
+        {QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf"), "  carl  \n\nalice\n"},
+        {QStringLiteral("/etc/vsftpd.chroot_list"), "bob \n"},
+        {QStringLiteral("/etc/ftpusers"), "# deny\n      root\n"},
+        {QStringLiteral("/etc/vsftpd.d/users.d/bob"), "# bob\n        local_root=/srv/bob\nwrite_enable=YES"},
+        {QStringLiteral("/etc/vsftpd.d/users.d/alice"), "download_enable=NO\n"},
     };
 }
 
-struct Engine
-{
-    FixtureRoot root;
-    ScriptedInteraction interaction;
-    std::unique_ptr<FtpServerConfig> config;
-
-    bool load(const FileMap &files)
-    {
-        return root.write(files) && reload();
-    }
-
-    bool reload()
-    {
-        config = std::make_unique<FtpServerConfig>(interaction, RootDirectory(root.path()));
-        CaptureStream out(std::cout);
-        config->load();
-        return true;
-    }
-};
-
-// Every regular file below the root except the database environment.
-QMap<QString, QByteArray> snapshot(const FixtureRoot &root)
-{
-    QMap<QString, QByteArray> files;
-    QDirIterator it(root.path(), QDir::Files | QDir::Hidden | QDir::System, QDirIterator::Subdirectories);
-    while (it.hasNext()) {
-        const QString path = it.next().mid(root.path().size());
-        if (path.startsWith(QLatin1String("/var/lib/ftpconfig/")))
-            continue;
-        files.insert(path, root.readFile(path));
-    }
-    return files;
-}
-
-QStringList differences(const QMap<QString, QByteArray> &before, const QMap<QString, QByteArray> &after)
+QStringList differences(const FileMap &before, const FileMap &after)
 {
     QStringList changed;
-    QSet<QString> all;
-    for (auto it = before.begin(); it != before.end(); ++it)
-        all.insert(it.key());
-    for (auto it = after.begin(); it != after.end(); ++it)
-        all.insert(it.key());
-    for (const QString &path : all) {
-        if (before.value(path, "<absent>") != after.value(path, "<absent>"))
+    for (const QString &path : before.keys() + after.keys()) {
+        if (!changed.contains(path) && before.value(path, "<absent>") != after.value(path, "<absent>"))
             changed << path;
     }
     changed.sort();
@@ -123,16 +77,16 @@ void TestSave::initTestCase()
 
 void TestSave::unchangedSave()
 {
-    Engine engine;
+    EngineFixture engine;
     QVERIFY(engine.load(richFiles()));
-    const auto before = snapshot(engine.root);
+    const auto before = engine.root.files();
     QVERIFY(engine.config->save());
-    const auto after = snapshot(engine.root);
+    const auto after = engine.root.files();
     // Only what a save changes on purpose: the userlist is always enabled,
     // before the trailing empty lines; a file that is written has its
     // indentation printed as tabs of four columns and spaces.
-    QCOMPARE(differences(before, after), QStringList{"/etc/vsftpd.conf"});
-    QCOMPARE(after["/etc/vsftpd.conf"],
+    QCOMPARE(differences(before, after), QStringList{QStringLiteral("/etc/vsftpd.conf")});
+    QCOMPARE(after[QStringLiteral("/etc/vsftpd.conf")],
              QByteArray("# Example config\nlisten=YES\n\t  local_enable=YES\nanon_root = "
                         "/srv/ftp  \nuserlist_file=/etc/vsftpd.d/allowed_user_list.conf\n"
                         "chroot_list_enable=YES\nuserlist_enable=yes\n\n\n"));
@@ -140,22 +94,22 @@ void TestSave::unchangedSave()
 
     // Saving again changes nothing at all.
     QVERIFY(engine.config->save());
-    QCOMPARE(differences(after, snapshot(engine.root)), QStringList());
+    QCOMPARE(differences(after, engine.root.files()), QStringList());
 }
 
 void TestSave::changeSaveReload()
 {
-    Engine engine;
+    EngineFixture engine;
     FileMap files = richFiles();
-    files.insert("/etc/pam.d/vsftpd",
+    files.insert(QStringLiteral("/etc/pam.d/vsftpd"),
                  "auth sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
                  "account sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
                  "auth required pam_listfile.so item=user sense=deny file=/etc/ftpusers\n");
     QVERIFY(engine.load(files));
-    const auto before = snapshot(engine.root);
+    const auto before = engine.root.files();
     FtpServerConfig &config = *engine.config;
     CaptureStream out(std::cout);
-    QVERIFY(config.setUserRights("alice", "write, download"));
+    QVERIFY(config.setUserRights("alice", QStringLiteral("write, download")));
     QVERIFY(config.checkFtpusers("root", true, nullptr));
     config.blockUserByUserlist("bob");
     config.setChrooted("alice");
@@ -164,17 +118,19 @@ void TestSave::changeSaveReload()
     QCOMPARE(engine.interaction.records.size(), 0);
 
     QCOMPARE(
-        differences(before, snapshot(engine.root)),
-        (QStringList{"/etc/ftpusers", "/etc/vsftpd.chroot_list", "/etc/vsftpd.conf",
-                     "/etc/vsftpd.d/allowed_user_list.conf", "/etc/vsftpd.d/users.d/alice", "/etc/vsftpd/virtual.db"}));
-    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/allowed_user_list.conf"), QByteArray("carl\nalice\nbob\n"));
-    QCOMPARE(engine.root.readFile("/etc/vsftpd.chroot_list"), QByteArray("bob\nalice\n"));
-    QCOMPARE(engine.root.readFile("/etc/ftpusers"), QByteArray("# deny\n"));
-    QCOMPARE(engine.root.readFile("/etc/vsftpd.d/users.d/alice"),
+        differences(before, engine.root.files()),
+        QStringLiteral("/etc/ftpusers /etc/vsftpd.chroot_list /etc/vsftpd.conf /etc/vsftpd.d/allowed_user_list.conf "
+                       "/etc/vsftpd.d/users.d/alice /etc/vsftpd/virtual.db")
+            .split(QLatin1Char(' ')));
+    QCOMPARE(engine.root.readFile(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")),
+             QByteArray("carl\nalice\nbob\n"));
+    QCOMPARE(engine.root.readFile(QStringLiteral("/etc/vsftpd.chroot_list")), QByteArray("bob\nalice\n"));
+    QCOMPARE(engine.root.readFile(QStringLiteral("/etc/ftpusers")), QByteArray("# deny\n"));
+    QCOMPARE(engine.root.readFile(QStringLiteral("/etc/vsftpd.d/users.d/alice")),
              QByteArray("download_enable=yes\nwrite_enable=yes\nanon_upload_enable=no\n\n"));
 
-    const auto saved = snapshot(engine.root);
-    QVERIFY(engine.reload());
+    const auto saved = engine.root.files();
+    QVERIFY(engine.start());
     FtpServerConfig &again = *engine.config;
     QVERIFY(again.checkAccess("root", false) == false); // still a "*" in shadow, but no longer listed
     QVERIFY(!again.checkAccess("bob", false));
@@ -184,7 +140,7 @@ void TestSave::changeSaveReload()
     QVERIFY(again.isVirtualUser("vera"));
     QCOMPARE(::rightsText(again.userRights("alice")), QStringLiteral("write, download, mkdir"));
     QVERIFY(again.save());
-    QCOMPARE(differences(saved, snapshot(engine.root)), QStringList());
+    QCOMPARE(differences(saved, engine.root.files()), QStringList());
 }
 
 void TestSave::saveIsStable_data()
@@ -216,10 +172,11 @@ void TestSave::saveIsStable()
 {
     QFETCH(QString, kind);
     QFETCH(QByteArray, content);
-    const QMap<QString, QString> files{{"main", "/etc/vsftpd.conf"},
-                                       {"pam", "/etc/pam.d/vsftpd"},
-                                       {"userlist", "/etc/vsftpd.d/allowed_user_list.conf"},
-                                       {"peruser", "/etc/vsftpd.d/users.d/bob"}};
+    const QMap<QString, QString> files{
+        {QStringLiteral("main"), QStringLiteral("/etc/vsftpd.conf")},
+        {QStringLiteral("pam"), QStringLiteral("/etc/pam.d/vsftpd")},
+        {QStringLiteral("userlist"), QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")},
+        {QStringLiteral("peruser"), QStringLiteral("/etc/vsftpd.d/users.d/bob")}};
     FileMap input = richFiles();
     // The main file keeps naming the files the others are written to.
     if (kind == QLatin1String("main"))
@@ -244,20 +201,17 @@ void TestSave::saveIsStable()
         config.setModified(true);
     };
 
-    Engine engine;
+    EngineFixture engine;
     CaptureStream out(std::cout);
     CaptureStream err(std::cerr);
-    try {
-        QVERIFY(engine.load(input));
-    } catch (const ProcessExit &) {
+    if (!engine.load(input))
         return; // a main file that names no usable PAM file: nothing to save
-    }
     edit(*engine.config, "a");
     engine.config->save();
     const QByteArray first = engine.root.readFile(files[kind]);
     QVERIFY(first.contains("probe") && first.contains('a'));
 
-    QVERIFY(engine.reload());
+    QVERIFY(engine.start());
     edit(*engine.config, "b");
     engine.config->save();
     QByteArray expected = first;
@@ -273,21 +227,23 @@ void TestSave::failures_data()
     QTest::addColumn<QStringList>("texts");
     QTest::addColumn<QString>("written"); // a file that must still be saved
 
-    QTest::newRow("PAM file gone") << "pam"
-                                   << QStringList{"Save PAM file|Unable to find vsftpd PAM config file (default is in "
-                                                  "/etc/pam.d/vsftpd).\nIt is neccesary for virtual users mechanism. "
-                                                  "Create it and re-run ftp config"}
-                                   << "/etc/vsftpd.d/allowed_user_list.conf";
+    const QString notDirectory = QStringLiteral("||cannot create a temporary file: Not a directory");
+    QTest::newRow("PAM file gone") << QStringLiteral("pam")
+                                   << QStringList{QStringLiteral(
+                                          "Save PAM file|Unable to find vsftpd PAM config file (default is in "
+                                          "/etc/pam.d/vsftpd).\nIt is neccesary for virtual users mechanism. "
+                                          "Create it and re-run ftp config")}
+                                   << QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf");
     QTest::newRow("userlist directory impossible")
-        << "userlist"
-        << QStringList{"|Unable to create path /etc/blocked/sub. Server may not start.",
-                       "|Unable to save /etc/blocked/sub/list||cannot create a temporary file: Not a directory"}
-        << "/etc/vsftpd.chroot_list";
+        << QStringLiteral("userlist")
+        << QStringList{QStringLiteral("|Unable to create path /etc/blocked/sub. Server may not start."),
+                       QStringLiteral("|Unable to save /etc/blocked/sub/list") + notDirectory}
+        << QStringLiteral("/etc/vsftpd.chroot_list");
     QTest::newRow("per-user directory impossible")
-        << "userdir"
-        << QStringList{"|Unable to create path /etc/vsftpd.d/users.d/. Server may not start.",
-                       "|Unable to save /etc/vsftpd.d/users.d/bob||cannot create a temporary file: Not a directory"}
-        << "/etc/vsftpd.conf";
+        << QStringLiteral("userdir")
+        << QStringList{QStringLiteral("|Unable to create path /etc/vsftpd.d/users.d/. Server may not start."),
+                       QStringLiteral("|Unable to save /etc/vsftpd.d/users.d/bob") + notDirectory}
+        << QStringLiteral("/etc/vsftpd.conf");
 }
 
 void TestSave::failures()
@@ -296,53 +252,54 @@ void TestSave::failures()
     QFETCH(QStringList, texts);
     QFETCH(QString, written);
 
-    Engine engine;
+    EngineFixture engine;
     QVERIFY(engine.load(richFiles()));
     CaptureStream out(std::cout);
     CaptureStream err(std::cerr);
-    engine.config->userlist().append("dora");
+    engine.config->userlist().append(QStringLiteral("dora"));
     engine.config->setChrooted("alice");
     QVERIFY(engine.config->setUserRoot("bob", "/srv/elsewhere"));
     if (damage == QLatin1String("pam")) {
-        QVERIFY(QFile::remove(engine.root.filePath("/etc/pam.d/vsftpd")));
+        QVERIFY(QFile::remove(engine.root.filePath(QStringLiteral("/etc/pam.d/vsftpd"))));
     } else if (damage == QLatin1String("userlist")) {
-        QVERIFY(engine.root.writeFile("/etc/blocked", "a file where a directory should be"));
+        QVERIFY(engine.root.writeFile(QStringLiteral("/etc/blocked"), "a file where a directory should be"));
         setValue(engine.config->mainConfig().elements, "", "userlist_file", "/etc/blocked/sub/list");
-        engine.config->userlist().append("erin");
+        engine.config->userlist().append(QStringLiteral("erin"));
     } else {
-        QDir(engine.root.filePath("/etc/vsftpd.d/users.d")).removeRecursively();
-        QVERIFY(engine.root.writeFile("/etc/vsftpd.d/users.d", "a file"));
+        QDir(engine.root.filePath(QStringLiteral("/etc/vsftpd.d/users.d"))).removeRecursively();
+        QVERIFY(engine.root.writeFile(QStringLiteral("/etc/vsftpd.d/users.d"), "a file"));
     }
     QVERIFY(!engine.config->save());
     QCOMPARE(engine.interaction.texts(), texts);
     QVERIFY2(engine.root.exists(written), qPrintable(written));
     // Whatever failed, the main configuration is written last all the same.
-    QVERIFY(engine.root.readFile("/etc/vsftpd.conf").contains("userlist_enable=yes\n"));
+    QVERIFY(engine.root.readFile(QStringLiteral("/etc/vsftpd.conf")).contains("userlist_enable=yes\n"));
     if (damage == QLatin1String("userdir"))
-        QVERIFY(QString::fromStdString(err.text()).contains("Unable to create userconf dir: /etc/vsftpd.d/users.d/\n"));
+        QVERIFY(QString::fromStdString(err.text())
+                    .contains(QStringLiteral("Unable to create userconf dir: /etc/vsftpd.d/users.d/\n")));
 }
 
 void TestSave::writerKeepsModeAndOwner()
 {
     FixtureRoot root;
-    QVERIFY(root.writeFile("/etc/private.conf", "old\n", 0640));
-    const QString path = root.filePath("/etc/private.conf");
+    QVERIFY(root.writeFile(QStringLiteral("/etc/private.conf"), "old\n", 0640));
+    const QString path = root.filePath(QStringLiteral("/etc/private.conf"));
     QCOMPARE(::chown(QFile::encodeName(path).constData(), 1000, 1001), 0);
     QVERIFY(!writeFileAtomically(path, "new\n"));
     const struct stat info = statOf(path);
     QCOMPARE(info.st_mode & 07777, 0640u);
     QCOMPARE(info.st_uid, 1000u);
     QCOMPARE(info.st_gid, 1001u);
-    QCOMPARE(root.readFile("/etc/private.conf"), QByteArray("new\n"));
+    QCOMPARE(root.readFile(QStringLiteral("/etc/private.conf")), QByteArray("new\n"));
     // No temporary file is left behind, nor one an interrupted write left.
-    QVERIFY(root.writeFile("/etc/.private.conf.ftpconfig-a1B2c3", "torn"));
-    QVERIFY(root.writeFile("/etc/.other.ftpconfig-a1B2c3", "not ours to remove"));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/.private.conf.ftpconfig-a1B2c3"), "torn"));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/.other.ftpconfig-a1B2c3"), "not ours to remove"));
     QVERIFY(!writeFileAtomically(path, "newer\n"));
-    QCOMPARE(QDir(root.filePath("/etc")).entryList(QDir::Files | QDir::Hidden),
-             (QStringList{".other.ftpconfig-a1B2c3", "private.conf"}));
+    QCOMPARE(QDir(root.filePath(QStringLiteral("/etc"))).entryList(QDir::Files | QDir::Hidden),
+             (QStringList{QStringLiteral(".other.ftpconfig-a1B2c3"), QStringLiteral("private.conf")}));
     // A new file gets the mode asked for.
-    QVERIFY(!writeFileAtomically(root.filePath("/etc/fresh"), "x", 0600));
-    QCOMPARE(statOf(root.filePath("/etc/fresh")).st_mode & 07777, 0600u);
+    QVERIFY(!writeFileAtomically(root.filePath(QStringLiteral("/etc/fresh")), "x", 0600));
+    QCOMPARE(statOf(root.filePath(QStringLiteral("/etc/fresh"))).st_mode & 07777, 0600u);
 }
 
 void TestSave::writerFollowsOnlyRootsLinks_data()
@@ -361,32 +318,33 @@ void TestSave::writerFollowsOnlyRootsLinks()
 {
     QFETCH(QString, plant);
     QFETCH(bool, kept);
-    Engine engine;
+    EngineFixture engine;
     QVERIFY(engine.load(richFiles()));
-    QVERIFY(engine.root.writeFile("/srv/repo/vsftpd.conf", engine.root.readFile("/etc/vsftpd.conf"), 0600));
-    const QString link = engine.root.filePath("/etc/vsftpd.conf");
-    const QString target = engine.root.filePath("/srv/repo/vsftpd.conf");
+    QVERIFY(engine.root.writeFile(QStringLiteral("/srv/repo/vsftpd.conf"),
+                                  engine.root.readFile(QStringLiteral("/etc/vsftpd.conf")), 0600));
+    const QString link = engine.root.filePath(QStringLiteral("/etc/vsftpd.conf"));
+    const QString target = engine.root.filePath(QStringLiteral("/srv/repo/vsftpd.conf"));
     QVERIFY(QFile::remove(link));
     QVERIFY(QFile::link(target, link));
     if (plant == QLatin1String("chown-link"))
         QCOMPARE(::lchown(QFile::encodeName(link).constData(), 1000, 1000), 0);
     if (plant == QLatin1String("open-dir"))
-        QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath("/etc")).constData(), 0777), 0);
+        QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath(QStringLiteral("/etc"))).constData(), 0777), 0);
     if (plant == QLatin1String("open-target-dir"))
-        QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath("/srv/repo")).constData(), 0775), 0);
-    const QByteArray before = engine.root.readFile("/srv/repo/vsftpd.conf");
+        QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath(QStringLiteral("/srv/repo"))).constData(), 0775), 0);
+    const QByteArray before = engine.root.readFile(QStringLiteral("/srv/repo/vsftpd.conf"));
 
     setValue(engine.config->mainConfig().elements, "", "ftpd_banner", "changed");
     QCOMPARE(engine.config->save(), kept);
     QVERIFY(QFileInfo(link).isSymLink());
     QCOMPARE(statOf(target).st_mode & 07777, 0600u);
     if (kept) {
-        QVERIFY(engine.root.readFile("/srv/repo/vsftpd.conf").contains("ftpd_banner=changed"));
+        QVERIFY(engine.root.readFile(QStringLiteral("/srv/repo/vsftpd.conf")).contains("ftpd_banner=changed"));
         QCOMPARE(engine.interaction.records.size(), 0);
     } else {
-        QCOMPARE(engine.root.readFile("/srv/repo/vsftpd.conf"), before);
+        QCOMPARE(engine.root.readFile(QStringLiteral("/srv/repo/vsftpd.conf")), before);
         QCOMPARE(engine.interaction.records.size(), 1);
-        QCOMPARE(engine.interaction.records[0].message.text, QString("Unable to save /etc/vsftpd.conf"));
+        QCOMPARE(engine.interaction.records[0].message.text, QStringLiteral("Unable to save /etc/vsftpd.conf"));
         QVERIFY(!engine.interaction.records[0].message.detailedText.isEmpty());
     }
 }
@@ -394,26 +352,26 @@ void TestSave::writerFollowsOnlyRootsLinks()
 void TestSave::writerRefusesDirectories()
 {
     FixtureRoot root;
-    QVERIFY(root.makeDirectory("/etc/dir"));
-    QVERIFY(writeFileAtomically(root.filePath("/etc/dir"), "x")
+    QVERIFY(root.makeDirectory(QStringLiteral("/etc/dir")));
+    QVERIFY(writeFileAtomically(root.filePath(QStringLiteral("/etc/dir")), "x")
                 .value_or(QString())
-                .startsWith("the target is a directory"));
-    QVERIFY(writeFileAtomically(root.filePath("/missing/dir/file"), "x")
+                .startsWith(QStringLiteral("the target is a directory")));
+    QVERIFY(writeFileAtomically(root.filePath(QStringLiteral("/missing/dir/file")), "x")
                 .value_or(QString())
-                .startsWith("cannot create a temporary file"));
+                .startsWith(QStringLiteral("cannot create a temporary file")));
 }
 
 void TestSave::hiddenFilesAreNoUsers()
 {
     // Leftovers of an interrupted save, or an editor's backup, are no users.
-    Engine engine;
+    EngineFixture engine;
     FileMap files = richFiles();
-    files.insert("/etc/vsftpd.d/users.d/.bob.ftpconfig-Ab12Cd", "write_enable=YES\n");
+    files.insert(QStringLiteral("/etc/vsftpd.d/users.d/.bob.ftpconfig-Ab12Cd"), "write_enable=YES\n");
     QVERIFY(engine.load(files));
     QStringList users;
     for (const auto &entry : engine.config->userConfigs())
         users << QString::fromUtf8(entry.first);
-    QCOMPARE(users, (QStringList{"alice", "bob"}));
+    QCOMPARE(users, (QStringList{QStringLiteral("alice"), QStringLiteral("bob")}));
 }
 
 void TestSave::serverReadsTheProgramsUserlist()
@@ -421,13 +379,13 @@ void TestSave::serverReadsTheProgramsUserlist()
     // Debian's configuration names no userlist: once a save enables the
     // list, vsftpd must be told which file the program keeps, or it looks
     // for its own default, finds nothing and refuses every login.
-    Engine engine;
-    QVERIFY(engine.load({{"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\n"}}));
+    EngineFixture engine;
+    QVERIFY(engine.load({{QStringLiteral("/etc/vsftpd.conf"), "listen=YES\nlocal_enable=YES\n"}}));
     QVERIFY(engine.config->save());
-    QCOMPARE(engine.root.readFile("/etc/vsftpd.conf"),
+    QCOMPARE(engine.root.readFile(QStringLiteral("/etc/vsftpd.conf")),
              QByteArray("listen=YES\nlocal_enable=YES\nuserlist_enable=yes\n"
                         "userlist_file=/etc/vsftpd.d/allowed_user_list.conf\n"));
-    QVERIFY(engine.root.exists("/etc/vsftpd.d/allowed_user_list.conf"));
+    QVERIFY(engine.root.exists(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")));
 }
 
 FTPCONFIG_TEST_GUILESS_MAIN(TestSave)

@@ -3,11 +3,7 @@
 #include "TemporaryRoot.h"
 
 #include <QByteArray>
-#include <QMap>
 #include <QString>
-
-// Files of a root by the absolute paths the program knows them by.
-using FileMap = QMap<QString, QByteArray>;
 
 // A temporary root with a small Debian-like system:
 //   root, ftp (home /srv/ftp), bob and alice with hashes, locked ("!" in

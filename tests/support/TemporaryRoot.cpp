@@ -1,6 +1,7 @@
 #include "TemporaryRoot.h"
 
 #include <QDir>
+#include <QDirIterator>
 #include <QFile>
 #include <QFileInfo>
 
@@ -56,4 +57,24 @@ bool TemporaryRoot::exists(const QString &absolutePath) const
 bool TemporaryRoot::makeDirectory(const QString &absolutePath) const
 {
     return QDir().mkpath(filePath(absolutePath));
+}
+
+FileMap TemporaryRoot::files() const
+{
+    return regularFiles(m_dir.path());
+}
+
+FileMap regularFiles(const QString &directory)
+{
+    FileMap files;
+    QDirIterator it(directory, QDir::Files | QDir::Hidden | QDir::System, QDirIterator::Subdirectories);
+    while (it.hasNext()) {
+        const QString path = it.next();
+        const QString name = path.mid(directory.size());
+        if (name.startsWith(QLatin1String("/var/lib/ftpconfig/")))
+            continue;
+        QFile file(path);
+        files.insert(name, file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("<unreadable>"));
+    }
+    return files;
 }

@@ -1,8 +1,16 @@
 #pragma once
 
 #include <QByteArray>
+#include <QMap>
 #include <QString>
 #include <QTemporaryDir>
+
+// Files of a root by the absolute paths the program knows them by.
+using FileMap = QMap<QString, QByteArray>;
+
+// Every regular file below the directory, by its path below it, except the
+// database environment (/var/lib/ftpconfig/), which recovers on its own.
+FileMap regularFiles(const QString &directory);
 
 // A private directory that stands for "/" in a test: files are named by the
 // absolute paths the program knows them by and land below the directory.
@@ -21,6 +29,7 @@ public:
     QByteArray readFile(const QString &absolutePath) const;
     bool exists(const QString &absolutePath) const;
     bool makeDirectory(const QString &absolutePath) const;
+    FileMap files() const;
 
 private:
     QTemporaryDir m_dir;
