@@ -61,12 +61,13 @@ void TestAccountStore::badPassword()
     QFETCH(bool, bad);
 
     TemporaryRoot root;
-    QVERIFY(root.writeFile("/etc/passwd", "bob:" + passwdField + ":1000:1000:Bob:/home/bob:/bin/bash\n"));
+    QVERIFY(
+        root.writeFile(QStringLiteral("/etc/passwd"), "bob:" + passwdField + ":1000:1000:Bob:/home/bob:/bin/bash\n"));
     QByteArray shadow = "shadowonly:!:19000:0:99999:7:::\n";
     if (shadowField != "-")
         shadow += "bob:" + shadowField + ":19000:0:99999:7:::\n";
-    QVERIFY(root.writeFile("/etc/shadow", shadow, 0600));
-    QVERIFY(root.writeFile("/etc/group", "bob:x:1000:\n"));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/shadow"), shadow, 0600));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/group"), "bob:x:1000:\n"));
 
     const AccountStore store({}, RootDirectory(root.path()));
     QCOMPARE(store.isBadPassword("bob"), bad);
@@ -79,11 +80,11 @@ void TestAccountStore::badPassword()
 void TestAccountStore::firstRecordWins()
 {
     TemporaryRoot root;
-    QVERIFY(root.writeFile("/etc/passwd",
+    QVERIFY(root.writeFile(QStringLiteral("/etc/passwd"),
                            "bob:x:1000:1000::/home/first:/bin/sh\n"
                            "bob:x:1001:1001::/home/second:/bin/sh\n"));
-    QVERIFY(root.writeFile("/etc/shadow", "bob:$6$h:1:0:9:7:::\nbob:*:1:0:9:7:::\n"));
-    QVERIFY(root.writeFile("/etc/group", "first:x:1000:\nsecond:x:1000:bob\nthird:x:1001:\n"));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/shadow"), "bob:$6$h:1:0:9:7:::\nbob:*:1:0:9:7:::\n"));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/group"), "first:x:1000:\nsecond:x:1000:bob\nthird:x:1001:\n"));
 
     const AccountStore store({}, RootDirectory(root.path()));
     AccountRecord record;
@@ -130,9 +131,10 @@ void TestAccountStore::userGroups()
     QFETCH(QByteArray, stderrText);
 
     TemporaryRoot root;
-    QVERIFY(root.writeFile("/etc/passwd", "bob:x:1000:1000::/home/bob:/bin/bash\nftp:x:107:50::/srv/ftp:/bin/false\n"));
-    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
-    QVERIFY(root.writeFile("/etc/group", groupFile));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/passwd"),
+                           "bob:x:1000:1000::/home/bob:/bin/bash\nftp:x:107:50::/srv/ftp:/bin/false\n"));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/shadow"), "", 0600));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/group"), groupFile));
     const AccountStore store({}, RootDirectory(root.path()));
 
     CaptureStream err(std::cerr);
@@ -156,19 +158,19 @@ void TestAccountStore::missingFiles()
 {
     QFETCH(QString, missing);
     TemporaryRoot root;
-    const QMap<QString, QByteArray> files{{"/etc/passwd", "bob:x:1000:1000::/home/bob:/bin/sh\n"},
-                                          {"/etc/shadow", "bob:*:1:0:9:7:::\n"},
-                                          {"/etc/group", "bob:x:1000:\n"}};
+    const FileMap files{{QStringLiteral("/etc/passwd"), "bob:x:1000:1000::/home/bob:/bin/sh\n"},
+                        {QStringLiteral("/etc/shadow"), "bob:*:1:0:9:7:::\n"},
+                        {QStringLiteral("/etc/group"), "bob:x:1000:\n"}};
     for (auto it = files.begin(); it != files.end(); ++it) {
         if (it.key() != missing)
             QVERIFY(root.writeFile(it.key(), it.value()));
     }
     CaptureStream err(std::cerr);
     const AccountStore store({}, RootDirectory(root.path()));
-    QCOMPARE(QString::fromStdString(err.text()), QStringLiteral("Unable to open ") + missing + '\n');
-    QCOMPARE(store.accounts().empty(), missing == "/etc/passwd");
-    QCOMPARE(store.shadow().empty(), missing == "/etc/shadow");
-    QCOMPARE(store.groups().empty(), missing == "/etc/group");
+    QCOMPARE(QString::fromStdString(err.text()), QStringLiteral("Unable to open %1\n").arg(missing));
+    QCOMPARE(store.accounts().empty(), missing == QLatin1String("/etc/passwd"));
+    QCOMPARE(store.shadow().empty(), missing == QLatin1String("/etc/shadow"));
+    QCOMPARE(store.groups().empty(), missing == QLatin1String("/etc/group"));
 }
 
 void TestAccountStore::systemEnumeration()
@@ -207,11 +209,11 @@ void TestAccountStore::systemUsers()
     QFETCH(bool, system);
 
     TemporaryRoot root;
-    QVERIFY(root.writeFile("/etc/passwd", passwdLine + '\n'));
-    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
-    QVERIFY(root.writeFile("/etc/group", ""));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/passwd"), passwdLine + '\n'));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/shadow"), "", 0600));
+    QVERIFY(root.writeFile(QStringLiteral("/etc/group"), ""));
     if (loginDefs != "-")
-        QVERIFY(root.writeFile("/etc/login.defs", loginDefs));
+        QVERIFY(root.writeFile(QStringLiteral("/etc/login.defs"), loginDefs));
     const AccountStore store({}, RootDirectory(root.path()));
     QCOMPARE(store.isSystemUser(passwdLine.left(passwdLine.indexOf(':'))), system);
     QVERIFY(!store.isSystemUser("no-such-account"));

@@ -1,5 +1,6 @@
-#include "TestMain.h"
 #include "RoundTrip.h"
+#include "Scenario.h"
+#include "TestMain.h"
 #include "config/ConfigFile.h"
 
 #include <QDir>
@@ -177,87 +178,19 @@ void TestConfigParser::printElements()
 
 void TestConfigParser::parse_data()
 {
-    QTest::addColumn<QByteArray>("input");
-    QTest::addColumn<int>("mode");
-    QTest::addColumn<QString>("structure");
-    QTest::addColumn<QByteArray>("output");
-
-    const int kv = static_cast<int>(SyntaxMode::KeyValue);
-    const int tl = static_cast<int>(SyntaxMode::TokenLine);
-
-    QTest::newRow("empty file") << QByteArray() << kv << QString() << QByteArray();
-    QTest::newRow("plain key") << QByteArray("listen=YES\n") << kv << "D0[listen|0|0|YES]"
-                               << QByteArray("listen=YES\n");
-    QTest::newRow("spaced key") << QByteArray("anon_root = /srv/ftp\n") << kv << "D0[anon_root|1|1|/srv/ftp]"
-                                << QByteArray("anon_root = /srv/ftp\n");
-    QTest::newRow("tabs around =") << QByteArray("\t\tkey\t=  v\n") << kv << "D8[key|4|2|v]"
-                                   << QByteArray("\t\tkey\t=  v\n");
-    QTest::newRow("six spaces indent") << QByteArray("      key=v\n") << kv << "D6[key|0|0|v]"
-                                       << QByteArray("\t  key=v\n");
-    QTest::newRow("first = splits") << QByteArray("banner=a=b c\n") << kv << "D0[banner|0|0|a=b c]"
-                                    << QByteArray("banner=a=b c\n");
-    QTest::newRow("value keeps trailing blanks")
-        << QByteArray("k=v  \n") << kv << "D0[k|0|0|v  ]" << QByteArray("k=v  \n");
-    QTest::newRow("crlf kept in value") << QByteArray("listen=YES\r\n") << kv << "D0[listen|0|0|YES\r]"
-                                        << QByteArray("listen=YES\r\n");
-    QTest::newRow("no final newline") << QByteArray("a=1\nb=2") << kv << "D0[a|0|0|1] ; D0[b|0|0|2]"
-                                      << QByteArray("a=1\nb=2\n");
-    QTest::newRow("commented setting") << QByteArray("#anonymous_enable=YES\n") << kv << "B(C0#anonymous_enable=YES)"
-                                       << QByteArray("#anonymous_enable=YES\n");
-    QTest::newRow("comment belongs to next line")
-        << QByteArray("  # note\n# more\nkey=v\n") << kv << "D0[key|0|0|v]<B(C2# note ; C0# more)>"
-        << QByteArray("  # note\n# more\nkey=v\n");
-    QTest::newRow("empty line separates comment")
-        << QByteArray("# a\n\nkey=v\n") << kv << "B(C0# a) ; E ; D0[key|0|0|v]" << QByteArray("# a\n\nkey=v\n");
-    QTest::newRow("tab-indented comment")
-        << QByteArray("\t#c\n  \t#d\n") << kv << "B(C4#c ; C6#d)" << QByteArray("\t#c\n\t  #d\n");
-    QTest::newRow("blank line blanks dropped")
-        << QByteArray("a=1\n   \t\nb=2\n") << kv << "D0[a|0|0|1] ; E ; D0[b|0|0|2]" << QByteArray("a=1\n\nb=2\n");
-    QTest::newRow("pam line") << QByteArray("auth required pam_userdb.so db=/var/lib/x\n") << tl
-                              << "X0[auth/1 required/1 pam_userdb.so/1 db=/var/lib/x/0]"
-                              << QByteArray("auth required pam_userdb.so db=/var/lib/x\n");
-    QTest::newRow("bracket control") << QByteArray("auth\t[success=1 default=ignore]\tpam_unix.so nullok \n") << tl
-                                     << "X0[auth/4 [success=1/1 default=ignore]/4 pam_unix.so/1 nullok/1]"
-                                     << QByteArray("auth\t[success=1 default=ignore]\tpam_unix.so nullok\n");
-    QTest::newRow("quotes hold blanks") << QByteArray("a 'b  c' \"d e\" f\n") << tl << "X0[a/1 'b  c'/1 \"d e\"/1 f/0]"
-                                        << QByteArray("a 'b  c' \"d e\" f\n");
-    QTest::newRow("open quote takes the rest")
-        << QByteArray("a 'b c  \n") << tl << "X0[a/1 'b c  /0]" << QByteArray("a 'b c  \n");
-    QTest::newRow("include") << QByteArray("@include common-auth\n") << tl << "I0[@include|1|common-auth]"
-                             << QByteArray("@include common-auth\n");
-    QTest::newRow("at sign inside a token")
-        << QByteArray("auth x pam_a.so user@host\n") << tl << "X0[auth/1 x/1 pam_a.so/1 user@host/0]"
-        << QByteArray("auth x pam_a.so user@host\n");
-    QTest::newRow("bracket section") << QByteArray("[global]\nkey=v\n") << kv << "S0/0[global]{}0 ; D0[key|0|0|v]"
-                                     << QByteArray("[global]\nkey=v\n");
-    QTest::newRow("bracket with text after is no section")
-        << QByteArray("[a] b\n") << tl << "X0[[a]/1 b/0]" << QByteArray("[a] b\n");
-    QTest::newRow("brace block") << QByteArray("# xinetd\nservice ftp {\n\tdisable = no\n  }\nx=1\n") << kv
-                                 << "S1/0[ftp]{D4[disable|1|1|no]}2<B(C0# xinetd)> ; D0[x|0|0|1]"
-                                 << QByteArray("# xinetd\nservice ftp { \n\tdisable = no\n  }\nx=1\n");
-    QTest::newRow("brace on its own line stays text") << QByteArray("service ftp\n{\n\tdisable = no\n}\n") << kv
-                                                      << "X0[service/1 ftp/0] ; X0[{/0] ; D4[disable|1|1|no] ; X0[}/0]"
-                                                      << QByteArray("service ftp\n{\n\tdisable = no\n}\n");
-    QTest::newRow("unclosed block stays text")
-        << QByteArray("service ftp {\nx=1\n") << kv << "X0[service/1 ftp/1 {/0] ; D0[x|0|0|1]"
-        << QByteArray("service ftp {\nx=1\n");
-    QTest::newRow("lone closing brace") << QByteArray("}\n") << kv << "X0[}/0]" << QByteArray("}\n");
-    QTest::newRow("equals is ordinary in token mode")
-        << QByteArray("db=/x\n") << tl << "X0[db=/x/0]" << QByteArray("db=/x\n");
+    addScenarioRows(QStringLiteral("config-parse.txt"));
 }
 
 void TestConfigParser::parse()
 {
-    QFETCH(QByteArray, input);
-    QFETCH(int, mode);
-    QFETCH(QString, structure);
-    QFETCH(QByteArray, output);
-
-    ConfigFile file(static_cast<SyntaxMode>(mode));
+    QFETCH(Scenario, scenario);
+    const QString input = scenario.value(QStringLiteral("input"));
+    ConfigFile file(scenario.value(QStringLiteral("mode")) == QLatin1String("token-line") ? SyntaxMode::TokenLine
+                                                                                          : SyntaxMode::KeyValue);
     std::istringstream in(input.toStdString());
     file.parse(in);
-    QCOMPARE(describe(file.elements), structure);
-    QCOMPARE(QByteArray::fromStdString(file.text()), output);
+    QCOMPARE(describe(file.elements), scenario.value(QStringLiteral("structure")));
+    QCOMPARE(QString::fromStdString(file.text()), scenario.value(QStringLiteral("output"), input));
 }
 
 void TestConfigParser::roundTrip_data()

@@ -2,13 +2,9 @@
 // authenticates the virtual users against the database file we saved. Runs
 // only inside scripts/with-private-etc.sh, which gives it a private /etc.
 #include "CaptureStream.h"
-#include "FixtureRoot.h"
+#include "EngineFixture.h"
 #include "Process.h"
-#include "ScriptedInteraction.h"
-#include "TemporaryRoot.h"
 #include "TestMain.h"
-#include "accounts/AccountStore.h"
-#include "policy/FtpServerConfig.h"
 
 #include <iostream>
 
@@ -96,11 +92,8 @@ void TestPamUserdb::writePamService(const QByteArray &db)
 
 void TestPamUserdb::pamReadsTheStore()
 {
-    TemporaryRoot root;
-    QVERIFY(root.writeFile("/etc/passwd", "root:x:0:0::/root:/bin/sh\n"));
-    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
-    QVERIFY(root.writeFile("/etc/group", "root:x:0:\n"));
-
+    FixtureRoot root;
+    QVERIFY(root.write());
     writePamService(QFile::encodeName(root.filePath(QString::fromUtf8(DbPath))));
 
     {
@@ -141,27 +134,23 @@ void TestPamUserdb::pamReadsTheStore()
 // the users nobody touched must still log in afterwards.
 void TestPamUserdb::recoveryKeepsUntouchedUsers()
 {
-    FixtureRoot root;
-    QVERIFY(root.write({{"/etc/pam.d/vsftpd",
-                         "auth sufficient pam_userdb.so db=" + DbPath
-                             + "\n"
-                               "account sufficient pam_userdb.so db="
-                             + DbPath + "\n"}}));
-    QVERIFY(root.writeVirtualUsers(QString::fromUtf8(DbPath + ".db"), {{"anna", "a1"}, {"ben", "b2"}}));
-    writePamService(QFile::encodeName(root.filePath(QString::fromUtf8(DbPath))));
-
-    ScriptedInteraction interaction;
-    CaptureStream out(std::cout);
-    CaptureStream err(std::cerr);
-    FtpServerConfig config(interaction, RootDirectory(root.path()));
-    config.load();
+    EngineFixture engine;
+    QVERIFY(engine.write(
+        {{QStringLiteral("/etc/pam.d/vsftpd"),
+          "auth sufficient pam_userdb.so db=" + DbPath + "\naccount sufficient pam_userdb.so db=" + DbPath + "\n"}}));
+    QVERIFY(engine.root.writeVirtualUsers(QString::fromUtf8(DbPath + ".db"), {{"anna", "a1"}, {"ben", "b2"}}));
+    writePamService(QFile::encodeName(engine.root.filePath(QString::fromUtf8(DbPath))));
+    QVERIFY(engine.start());
+    FtpServerConfig &config = *engine.config;
     config.accounts().addVirtualUser("carl", "c3");
     // Garbage over the environment's shared region, as a crash might leave it.
-    QFile region(root.filePath(QStringLiteral("/var/lib/ftpconfig/__db.001")));
+    QFile region(engine.root.filePath(QStringLiteral("/var/lib/ftpconfig/__db.001")));
     QVERIFY(region.open(QIODevice::ReadWrite));
     QVERIFY(region.write(QByteArray(int(region.size()), '\x7f')) > 0);
     region.close();
 
+    CaptureStream out(std::cout);
+    CaptureStream err(std::cerr);
     config.save();
     QVERIFY2(QString::fromStdString(err.text()).contains(QLatin1String("Db env. error. Re-creating database")),
              err.text().c_str());

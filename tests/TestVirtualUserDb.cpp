@@ -1,7 +1,7 @@
-#include "TestMain.h"
 #include "CaptureStream.h"
+#include "FixtureRoot.h"
 #include "Process.h"
-#include "TemporaryRoot.h"
+#include "TestMain.h"
 #include "accounts/AccountStore.h"
 
 #include <QDir>
@@ -19,14 +19,6 @@ namespace {
 const QByteArray DbPath = "/var/lib/ftpconfig/vsftpd_virtual_users";
 const QString DbFile = QStringLiteral("/var/lib/ftpconfig/vsftpd_virtual_users.db");
 
-// A root with an empty account set, so that only the database matters.
-void writeAccounts(const TemporaryRoot &root)
-{
-    QVERIFY(root.writeFile("/etc/passwd", "root:x:0:0::/root:/bin/sh\n"));
-    QVERIFY(root.writeFile("/etc/shadow", "", 0600));
-    QVERIFY(root.writeFile("/etc/group", "root:x:0:\n"));
-}
-
 // "name=password/previous/state ..." in name order.
 QString describe(const std::map<QByteArray, VirtualUserRecord> &users)
 {
@@ -35,7 +27,8 @@ QString describe(const std::map<QByteArray, VirtualUserRecord> &users)
     for (const auto &[name, record] : users) {
         parts << QStringLiteral("%1=%2/%3/%4")
                      .arg(QString::fromUtf8(name), QString::fromUtf8(record.password),
-                          QString::fromUtf8(record.previousName), states[static_cast<int>(record.state)]);
+                          QString::fromUtf8(record.previousName),
+                          QLatin1String(states[static_cast<int>(record.state)]));
     }
     return parts.join(QLatin1Char(' '));
 }
@@ -78,14 +71,6 @@ QString dumped(const QString &file)
     return parts.join(QLatin1Char(' '));
 }
 
-bool loadWithDbLoad(const QString &file, const QByteArray &pairs)
-{
-    const ProcessResult result
-        = runProcess(QStringLiteral("db5.3_load"),
-                     {QStringLiteral("-T"), QStringLiteral("-t"), QStringLiteral("hash"), file}, pairs);
-    return result.finished && result.exitCode == 0;
-}
-
 int fileMode(const QString &path)
 {
     struct stat info
@@ -119,62 +104,68 @@ private slots:
 
 void TestVirtualUserDb::editStates_data()
 {
-    QTest::addColumn<QStringList>("operations");
-    QTest::addColumn<QString>("result");
+    QTest::addColumn<QByteArray>("operations"); // separated by ";"
+    QTest::addColumn<QByteArray>("result");
 
     // The database starts with anna=a1 and ben=b1.
-    QTest::newRow("loaded") << QStringList() << "anna=a1//Unchanged ben=b1//Unchanged";
-    QTest::newRow("add") << QStringList{"add carl c1"} << "anna=a1//Unchanged ben=b1//Unchanged carl=c1//Added";
+    QTest::newRow("loaded") << QByteArray() << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
+    QTest::newRow("add") << QByteArray("add carl c1")
+                         << QByteArray("anna=a1//Unchanged ben=b1//Unchanged carl=c1//Added");
     QTest::newRow("add existing changes nothing")
-        << QStringList{"add anna other"} << "anna=a1//Unchanged ben=b1//Unchanged";
-    QTest::newRow("remove keeps the entry") << QStringList{"remove ben"} << "anna=a1//Unchanged ben=b1//Deleted";
-    QTest::newRow("remove then add") << QStringList{"remove ben", "add ben b2"} << "anna=a1//Unchanged ben=b2//Added";
-    QTest::newRow("password change") << QStringList{"change anna anna a2"} << "anna=a2//Modified ben=b1//Unchanged";
+        << QByteArray("add anna other") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
+    QTest::newRow("remove keeps the entry")
+        << QByteArray("remove ben") << QByteArray("anna=a1//Unchanged ben=b1//Deleted");
+    QTest::newRow("remove then add") << QByteArray("remove ben;add ben b2")
+                                     << QByteArray("anna=a1//Unchanged ben=b2//Added");
+    QTest::newRow("password change") << QByteArray("change anna anna a2")
+                                     << QByteArray("anna=a2//Modified ben=b1//Unchanged");
     QTest::newRow("same password changes nothing")
-        << QStringList{"change anna anna a1"} << "anna=a1//Unchanged ben=b1//Unchanged";
+        << QByteArray("change anna anna a1") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
     QTest::newRow("empty password never clears")
-        << QStringList{"change anna anna -"} << "anna=a1//Unchanged ben=b1//Unchanged";
-    QTest::newRow("rename") << QStringList{"change anna anne -"} << "anne=a1/anna/Modified ben=b1//Unchanged";
-    QTest::newRow("rename twice keeps the middle name")
-        << QStringList{"change anna anne -", "change anne annie -"} << "annie=a1/anne/Modified ben=b1//Unchanged";
-    QTest::newRow("rename onto an existing user") << QStringList{"change anna ben x9"} << "ben=x9/anna/Modified";
-    QTest::newRow("rename an added user") << QStringList{"add carl c1", "change carl karl -"}
-                                          << "anna=a1//Unchanged ben=b1//Unchanged karl=c1/carl/Modified";
-    QTest::newRow("change an absent user") << QStringList{"change zed zoe z"} << "anna=a1//Unchanged ben=b1//Unchanged";
+        << QByteArray("change anna anna -") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
+    QTest::newRow("rename") << QByteArray("change anna anne -")
+                            << QByteArray("anne=a1/anna/Modified ben=b1//Unchanged");
+    QTest::newRow("rename twice keeps the middle name") << QByteArray("change anna anne -;change anne annie -")
+                                                        << QByteArray("annie=a1/anne/Modified ben=b1//Unchanged");
+    QTest::newRow("rename onto an existing user")
+        << QByteArray("change anna ben x9") << QByteArray("ben=x9/anna/Modified");
+    QTest::newRow("rename an added user") << QByteArray("add carl c1;change carl karl -")
+                                          << QByteArray("anna=a1//Unchanged ben=b1//Unchanged karl=c1/carl/Modified");
+    QTest::newRow("change an absent user")
+        << QByteArray("change zed zoe z") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
 }
 
 void TestVirtualUserDb::editStates()
 {
-    QFETCH(QStringList, operations);
-    QFETCH(QString, result);
+    QFETCH(QByteArray, operations);
+    QFETCH(QByteArray, result);
 
-    TemporaryRoot root;
-    writeAccounts(root);
-    QVERIFY(root.makeDirectory("/var/lib/ftpconfig"));
-    QVERIFY(loadWithDbLoad(root.filePath(DbFile), "anna\na1\nben\nb1\n"));
+    FixtureRoot root;
+    QVERIFY(root.write());
+    QVERIFY(root.writeVirtualUsers(DbFile, {{"anna", "a1"}, {"ben", "b1"}}));
 
     AccountStore store(DbPath, RootDirectory(root.path()));
-    for (const QString &operation : qAsConst(operations)) {
-        const QStringList w = operation.split(QLatin1Char(' '));
-        const auto bytes = [&](int i) { return w.at(i) == QLatin1String("-") ? QByteArray() : w.at(i).toUtf8(); };
-        if (w[0] == QLatin1String("add"))
+    for (const QByteArray &operation : operations.split(';')) {
+        const QList<QByteArray> w = operation.split(' ');
+        const auto bytes = [&](int i) { return w.at(i) == "-" ? QByteArray() : w.at(i); };
+        if (w[0] == "add")
             store.addVirtualUser(bytes(1), bytes(2));
-        else if (w[0] == QLatin1String("remove"))
+        else if (w[0] == "remove")
             store.removeVirtualUser(bytes(1));
-        else if (w[0] == QLatin1String("change"))
+        else if (w[0] == "change")
             store.changeVirtualUser(bytes(1), bytes(2), bytes(3));
         else
-            QFAIL("unknown operation");
+            QVERIFY(operation.isEmpty());
     }
-    QCOMPARE(describe(store.virtualUsers()), result);
+    QCOMPARE(describe(store.virtualUsers()).toUtf8(), result);
     for (const auto &[name, record] : store.virtualUsers())
         QVERIFY(store.isVirtualUser(name));
 }
 
 void TestVirtualUserDb::saveAndReload()
 {
-    TemporaryRoot root;
-    writeAccounts(root);
+    FixtureRoot root;
+    QVERIFY(root.write());
     {
         AccountStore store(DbPath, RootDirectory(root.path()));
         QCOMPARE(store.database()->filePath(), QByteArray(DbFile.toUtf8()));
@@ -204,10 +195,10 @@ void TestVirtualUserDb::saveAndReload()
 
 void TestVirtualUserDb::readsWhatDbLoadWrote()
 {
-    TemporaryRoot root;
-    writeAccounts(root);
-    QVERIFY(root.makeDirectory("/srv/db"));
-    QVERIFY(loadWithDbLoad(root.filePath("/srv/db/users.db"), "x\npass word\nyvonne\n\xc3\xa9t\xc3\xa9\n"));
+    FixtureRoot root;
+    QVERIFY(root.write());
+    QVERIFY(root.writeVirtualUsers(QStringLiteral("/srv/db/users.db"),
+                                   {{"x", "pass word"}, {"yvonne", "\xc3\xa9t\xc3\xa9"}}));
     const AccountStore store("/srv/db/users.db", RootDirectory(root.path()));
     QCOMPARE(describe(store.virtualUsers()), QString::fromUtf8("x=pass word//Unchanged yvonne=été//Unchanged"));
 }
@@ -231,23 +222,24 @@ void TestVirtualUserDb::filePaths()
     QFETCH(QByteArray, filePath);
     QFETCH(bool, opens);
 
-    TemporaryRoot root;
-    writeAccounts(root);
-    QVERIFY(root.makeDirectory("/work"));
+    FixtureRoot root;
+    QVERIFY(root.write());
+    QVERIFY(root.makeDirectory(QStringLiteral("/work")));
     const QString previous = QDir::currentPath();
-    QVERIFY(QDir::setCurrent(root.filePath("/work")));
+    QVERIFY(QDir::setCurrent(root.filePath(QStringLiteral("/work"))));
     CaptureStream err(std::cerr);
     {
         VirtualUserDb db(configured, RootDirectory(root.path()));
         QCOMPARE(db.filePath(), filePath);
         QCOMPARE(db.isOpen(), opens);
         if (opens) {
-            const QString onDisk = filePath.startsWith('/') ? root.filePath(QString::fromUtf8(filePath))
-                                                            : root.filePath("/work/" + QString::fromUtf8(filePath));
+            const QString onDisk = filePath.startsWith('/')
+                ? root.filePath(QString::fromUtf8(filePath))
+                : root.filePath(QStringLiteral("/work/") + QString::fromUtf8(filePath));
             QVERIFY2(QFileInfo::exists(onDisk), qPrintable(onDisk));
             QCOMPARE(fileMode(onDisk), 0600);
         } else {
-            QVERIFY(QString::fromStdString(err.text()).startsWith("Error opening database: " + filePath + '\n'));
+            QVERIFY(QByteArray::fromStdString(err.text()).startsWith("Error opening database: " + filePath + '\n'));
             QVERIFY_EXCEPTION_THROWN(db.readAll(), DbException);
             QVERIFY_EXCEPTION_THROWN(db.put("a", "b"), DbException);
         }
@@ -257,9 +249,9 @@ void TestVirtualUserDb::filePaths()
 
 void TestVirtualUserDb::unusableDirectory()
 {
-    TemporaryRoot root;
-    writeAccounts(root);
-    QVERIFY(root.writeFile("/srv/file", "not a directory"));
+    FixtureRoot root;
+    QVERIFY(root.write());
+    QVERIFY(root.writeFile(QStringLiteral("/srv/file"), "not a directory"));
     try {
         AccountStore store("/srv/file/db/users", RootDirectory(root.path()));
         QFAIL("no exception");
@@ -282,13 +274,12 @@ void TestVirtualUserDb::damaged()
 {
     QFETCH(QString, damage);
 
-    TemporaryRoot root;
-    writeAccounts(root);
-    QVERIFY(root.makeDirectory("/var/lib/ftpconfig"));
-    QByteArray pairs;
+    FixtureRoot root;
+    QVERIFY(root.write());
+    QMap<QByteArray, QByteArray> users;
     for (int i = 0; i < 300; ++i)
-        pairs += "user" + QByteArray::number(i) + "\npassword" + QByteArray::number(i) + "\n";
-    QVERIFY(loadWithDbLoad(root.filePath(DbFile), pairs));
+        users.insert("user" + QByteArray::number(i), "password" + QByteArray::number(i));
+    QVERIFY(root.writeVirtualUsers(DbFile, users));
     const QString file = root.filePath(DbFile);
     QByteArray oldBytes = root.readFile(DbFile);
     QVERIFY(oldBytes.size() > 8192);
@@ -300,9 +291,9 @@ void TestVirtualUserDb::damaged()
         oldBytes = QByteArray(5000, 'G');
         QVERIFY(root.writeFile(DbFile, oldBytes, 0600));
     } else if (damage == QLatin1String("environment")) {
-        QVERIFY(root.writeFile("/var/lib/ftpconfig/__db.001", QByteArray(3000, '\x7f')));
-        QVERIFY(root.writeFile("/var/lib/ftpconfig/log.0000000001", QByteArray(3000, 'L')));
-        QVERIFY(root.writeFile("/var/lib/ftpconfig/__db.register", "junk"));
+        QVERIFY(root.writeFile(QStringLiteral("/var/lib/ftpconfig/__db.001"), QByteArray(3000, '\x7f')));
+        QVERIFY(root.writeFile(QStringLiteral("/var/lib/ftpconfig/log.0000000001"), QByteArray(3000, 'L')));
+        QVERIFY(root.writeFile(QStringLiteral("/var/lib/ftpconfig/__db.register"), "junk"));
     } else {
         QVERIFY(QFile::remove(file));
         QVERIFY(root.makeDirectory(DbFile));
@@ -328,15 +319,14 @@ void TestVirtualUserDb::damaged()
     }
     store.saveVirtualUsers();
 
-    const QString text = QString::fromStdString(err.text());
+    const QByteArray text = QByteArray::fromStdString(err.text());
     if (damage != QLatin1String("environment") || !loaded) {
-        QVERIFY2(text.contains("Db env. error. Re-creating database\n"), qPrintable(text));
-        QVERIFY2(text.contains("Closing db...\nRemoving db...\n"), qPrintable(text));
-        QVERIFY2(text.contains("Home db: /var/lib/ftpconfig\n"), qPrintable(text));
-        QVERIFY2(text.contains("Iniit db...\n"), qPrintable(text));
+        for (const char *line : {"Db env. error. Re-creating database\n", "Closing db...\nRemoving db...\n",
+                                 "Home db: /var/lib/ftpconfig\n", "Iniit db...\n"})
+            QVERIFY2(text.contains(line), text.constData());
         const QByteArray backup = store.database()->lastBackupPath();
         QVERIFY2(backup.startsWith(DbPath + ".db.bak-"), backup.constData());
-        QVERIFY(text.contains("Keeping a copy of the old database in " + QString::fromUtf8(backup) + '\n'));
+        QVERIFY(text.contains("Keeping a copy of the old database in " + backup + '\n'));
         QCOMPARE(root.readFile(QString::fromUtf8(backup)), oldBytes);
         QCOMPARE(fileMode(root.filePath(QString::fromUtf8(backup))), 0600);
     }
@@ -365,8 +355,8 @@ void TestVirtualUserDb::recreateKeepsOnlyEdits()
     QFETCH(QString, afterSave);
     QFETCH(QString, copy);
 
-    TemporaryRoot root;
-    writeAccounts(root);
+    FixtureRoot root;
+    QVERIFY(root.write());
     {
         AccountStore store(configured, RootDirectory(root.path()));
         store.addVirtualUser("anna", "a1");
@@ -386,7 +376,8 @@ void TestVirtualUserDb::recreateKeepsOnlyEdits()
         QCOMPARE(backup.isEmpty(), copy.isEmpty());
         if (!copy.isEmpty())
             QCOMPARE(dumped(root.filePath(QString::fromUtf8(backup))), copy);
-        QVERIFY(QString::fromStdString(err.text()).contains(QRegularExpression("\nRemovinglog\\.0+1\n")));
+        QVERIFY(
+            QString::fromStdString(err.text()).contains(QRegularExpression(QStringLiteral("\nRemovinglog\\.0+1\n"))));
     }
     // What the re-created file holds survives another program run (one
     // at a time: the environment is not shared).
@@ -396,20 +387,21 @@ void TestVirtualUserDb::recreateKeepsOnlyEdits()
 
 void TestVirtualUserDb::readOnlyCreatesNothing()
 {
-    TemporaryRoot root;
-    writeAccounts(root);
+    FixtureRoot root;
+    QVERIFY(root.write());
     {
         const AccountStore store(DbPath, RootDirectory(root.path()), AccountStore::Access::ReadOnly);
         QVERIFY(store.virtualUsers().empty());
     }
-    QVERIFY(!root.exists("/var/lib/ftpconfig"));
-    QVERIFY(root.makeDirectory("/var/lib/ftpconfig"));
-    QVERIFY(loadWithDbLoad(root.filePath(DbFile), "anna\na1\n"));
-    const QStringList before = QDir(root.filePath("/var/lib/ftpconfig")).entryList(QDir::AllEntries | QDir::Hidden);
+    QVERIFY(!root.exists(QStringLiteral("/var/lib/ftpconfig")));
+    QVERIFY(root.writeVirtualUsers(DbFile, {{"anna", "a1"}}));
+    const QStringList before
+        = QDir(root.filePath(QStringLiteral("/var/lib/ftpconfig"))).entryList(QDir::AllEntries | QDir::Hidden);
     AccountStore store(DbPath, RootDirectory(root.path()), AccountStore::Access::ReadOnly);
     QCOMPARE(describe(store.virtualUsers()), QStringLiteral("anna=a1//Unchanged"));
     QVERIFY_EXCEPTION_THROWN(store.database()->put("x", "y"), DbException);
-    QCOMPARE(QDir(root.filePath("/var/lib/ftpconfig")).entryList(QDir::AllEntries | QDir::Hidden), before);
+    QCOMPARE(QDir(root.filePath(QStringLiteral("/var/lib/ftpconfig"))).entryList(QDir::AllEntries | QDir::Hidden),
+             before);
 }
 
 FTPCONFIG_TEST_GUILESS_MAIN(TestVirtualUserDb)
