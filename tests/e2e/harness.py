@@ -1,6 +1,6 @@
-"""What the end-to-end scripts share: the private /etc, accounts, PAM stacks,
-the server's settings, the vsftpd process, FTP logins, the report program
-and the run of a table of scenarios.
+"""What the end-to-end scripts share: the scenario tables (TOML files beside
+the scripts), the private /etc, accounts, PAM stacks, the server's settings,
+the vsftpd process, FTP logins, the report program and the run of a table.
 
 verdicts.py, forecast.py and saves.py import it from their own directory;
 each sets sys.dont_write_bytecode first, so that no compiled copy of it is
@@ -9,6 +9,7 @@ refuse to run outside scripts/with-private-etc.sh (see may_run).
 """
 
 import argparse
+import copy
 import ctypes
 import dataclasses
 import ftplib
@@ -16,10 +17,12 @@ import os
 import shutil
 import signal
 import socket
+import stat
 import subprocess
 import sys
 import tempfile
 import time
+import tomllib
 from typing import Callable, Dict, List, Optional, Sequence, Tuple
 
 VSFTPD = "/usr/sbin/vsftpd"
@@ -55,14 +58,16 @@ def password_of(name: str) -> str:
 
 @dataclasses.dataclass(frozen=True)
 class Account:
-    """A local account appended to /etc/passwd, /etc/shadow and /etc/group."""
+    """A local account appended to /etc/passwd, /etc/shadow and /etc/group.
+    A table writes it as "NAME key=value ...", e.g. "e2ebob home=readonly
+    groups=e2eftp expired"."""
 
     name: str
     shell: str = "/bin/bash"
     # "hash": the password set by chpasswd; "!" or "*": the whole shadow
     # field; "!hash": the hash with a "!" in front (usermod -L style).
     shadow: str = "hash"
-    passwd_field: str = "x"
+    passwd: str = "x"
     expired: bool = False
     # A form of HOME_FORMS, or "missing".
     home: str = "dir"
@@ -81,190 +86,185 @@ HOME_FORMS = {
     "world": (0o777, False, False),  # writable by every account
 }
 
-
-@dataclasses.dataclass(frozen=True)
-class Setup:
-    """What prepare() writes for a scenario; each script's Scenario adds
-    what it checks. Paths and lines may hold {tmp}, the scenario's own
-    temporary directory (and the configuration {port} too)."""
-
-    name: str
-    conf: List[str]  # lines after BASE_CONF in /etc/vsftpd.conf
-    accounts: List[Account] = dataclasses.field(default_factory=list, kw_only=True)
-    pam: Optional[List[str]] = dataclasses.field(default=None, kw_only=True)  # default DEBIAN_PAM
-    pam_service: str = dataclasses.field(default="vsftpd", kw_only=True)
-    # database file (with ".db") -> {virtual user: password}
-    dbs: Dict[str, Dict[str, str]] = dataclasses.field(default_factory=dict, kw_only=True)
-    # further files (lists), path -> lines; root-owned 0644, under /etc or {tmp}
-    files: Dict[str, List[str]] = dataclasses.field(default_factory=dict, kw_only=True)
-    # directories under {tmp}, owned by root, 0755
-    dirs: Tuple[str, ...] = dataclasses.field(default=(), kw_only=True)
-    # keys of BASE_CONF this scenario leaves out
-    omit: Tuple[str, ...] = dataclasses.field(default=(), kw_only=True)
-
-
-# Debian's /etc/pam.d/vsftpd, with the list file made a parameter.
-def debian_pam(ftpusers: str = "/etc/ftpusers") -> List[str]:
-    return [
-        "# Standard behaviour for ftpd(8).",
-        f"auth\trequired\tpam_listfile.so item=user sense=deny file={ftpusers} onerr=succeed",
-        "",
-        "# Standard pam includes",
-        "@include common-account",
-        "@include common-session",
-        "@include common-auth",
-        "auth\trequired\tpam_shells.so",
-    ]
-
-
-DEBIAN_PAM = debian_pam()
-
-# Debian 12's common stacks, written into the private /etc so that the
-# machine's own (LDAP, a PAM profile, ...) cannot change the server's side.
-# Two changes: "nodelay", because pam_unix's two-second pause after every
-# refused password would make the run take minutes, and no pam_systemd.
-COMMON_PAM = {
-    "/etc/pam.d/common-auth": [
-        "auth\t[success=1 default=ignore]\tpam_unix.so nullok nodelay",
-        "auth\trequisite\t\t\tpam_deny.so",
-        "auth\trequired\t\t\tpam_permit.so",
-    ],
-    "/etc/pam.d/common-account": [
-        "account\t[success=1 new_authtok_reqd=done default=ignore]\tpam_unix.so",
-        "account\trequisite\t\t\tpam_deny.so",
-        "account\trequired\t\t\tpam_permit.so",
-    ],
-    "/etc/pam.d/common-session": [
-        "session\t[default=1]\t\t\tpam_permit.so",
-        "session\trequisite\t\t\tpam_deny.so",
-        "session\trequired\t\t\tpam_permit.so",
-        "session\trequired\tpam_unix.so",
-    ],
-}
-
-
-# pam_userdb first, as the engine wants it, then the ordinary stack.
-def userdb_pam(auth_db: str, account_db: Optional[str] = None) -> List[str]:
-    return [
-        f"auth sufficient pam_userdb.so db={auth_db}",
-        f"account sufficient pam_userdb.so db={account_db or auth_db}",
-        "@include common-account",
-        "@include common-session",
-        "@include common-auth",
-        "auth required pam_shells.so",
-    ]
-
-
-# Every scenario runs with these. vsftpd stays in the foreground on the
-# loopback address; seccomp_sandbox=NO is Debian's default anyway and keeps
-# the sandbox of 3.0.3 from killing sessions on newer kernels. isolate and
-# isolate_network keep their defaults: they work under unshare -m as root.
-# A refused login is answered at once instead of after a second.
-BASE_CONF = [
-    "listen=YES",
-    "listen_address=127.0.0.1",
-    "listen_port={port}",
-    "background=NO",
-    "seccomp_sandbox=NO",
-    "secure_chroot_dir={tmp}/empty",
-    "delay_failed_login=0",
-    "ftp_username=e2eanon",
-    "anon_root={tmp}/anon",
-]
-
-# The account of anonymous sessions; never logs in itself.
+# The account of anonymous sessions, which never logs in itself, and the one
+# virtual users are mapped to; a table names them to change them.
 ANON_ACCOUNT = Account("e2eanon", shell="/usr/sbin/nologin", shadow="*", home="root", home_path="{tmp}/anon")
-# The account virtual users are mapped to.
 GUEST_ACCOUNT = Account("e2eguest", shell="/usr/sbin/nologin", shadow="*", home="root", home_path="{tmp}/guest")
 
-VDB = "{tmp}/vusers.db"
-VUSERS = {"e2evera": "vera-Pw7!", "e2evlad": "vlad-Pw7!"}
+
+def parse_account(text: str) -> Account:
+    name, *settings = text.split()
+    fields = {}
+    for setting in settings:
+        key, _, value = setting.partition("=")
+        fields[key] = True if key == "expired" else tuple(value.split(",")) if key == "groups" else value
+    base = {a.name: a for a in (ANON_ACCOUNT, GUEST_ACCOUNT)}.get(name, Account(name))
+    return dataclasses.replace(base, **fields)
+
+
+# The base configuration, Debian's PAM files: what every scenario starts from.
+with open(os.path.join(os.path.dirname(os.path.abspath(__file__)), "machine.toml"), "rb") as machine:
+    MACHINE = tomllib.load(machine)
+BASE_CONF: List[str] = MACHINE["base_conf"]
+DEBIAN_PAM: List[str] = MACHINE["debian_pam"]
+COMMON_PAM: Dict[str, List[str]] = MACHINE["common_pam"]
+
+
+class Scenario:
+    """One [[scenario]] of a table: what prepare() writes and what the
+    script checks. Paths and lines may hold {tmp}, the scenario's own
+    temporary directory (and the configuration {port} too)."""
+
+    DEFAULTS = {
+        "conf": [],  # lines after BASE_CONF in /etc/vsftpd.conf
+        "omit": [],  # keys of BASE_CONF this scenario leaves out
+        "accounts": [],
+        "pam": DEBIAN_PAM,
+        "pam_service": "vsftpd",
+        "dirs": [],  # directories under {tmp}, owned by root, 0755
+        "files": {},  # path -> lines; root's, 0644, under /etc or {tmp}
+        "dbs": {},  # database file (with ".db") -> {virtual user: password}
+        "shadow": {},  # user -> {field number: value}, set after the accounts
+        "users": {},
+    }
+
+    def __init__(self, table: dict, defaults: dict) -> None:
+        self.__dict__.update(copy.deepcopy({**self.DEFAULTS, **defaults}))
+        self.__dict__.update(table)
+        self.accounts = [parse_account(text) for text in self.accounts]
+        self.name: str = table["name"]
+
+
+def load_table(script: str, defaults: dict) -> List[Scenario]:
+    """The scenarios of the table beside the script (verdicts.py reads
+    verdicts.toml), with the script's defaults of the keys it adds."""
+    with open(os.path.splitext(script)[0] + ".toml", "rb") as source:
+        return [Scenario(table, defaults) for table in tomllib.load(source)["scenario"]]
 
 
 # Guards -------------------------------------------------------------------
-
 
 def etc_is_private() -> Tuple[bool, str]:
     if os.environ.get("FTPCONFIG_PRIVATE_ETC") != "1":
         return False, "FTPCONFIG_PRIVATE_ETC=1 is not set"
     try:
         with open("/proc/self/mountinfo", encoding="utf-8", errors="replace") as mountinfo:
-            for line in mountinfo:
-                fields = line.split()
-                if len(fields) > 4 and fields[4] == "/etc":
-                    return True, ""
+            if any(len(line.split()) > 4 and line.split()[4] == "/etc" for line in mountinfo):
+                return True, ""
     except OSError as error:
         return False, f"cannot read /proc/self/mountinfo: {error}"
     return False, "/etc is not a mount point"
 
 
-# The private /etc -------------------------------------------------------------
+# Trees ----------------------------------------------------------------------
+
+# What happened to a path between two captures (several joined by "+").
+CONTENT = "content"
+MODE = "mode"  # permission bits or owner
+CREATED = "created"
+REMOVED = "removed"
 
 
-class EtcSnapshot:
-    """Puts the files a scenario touches back as they were before it."""
+@dataclasses.dataclass(frozen=True)
+class Entry:
+    kind: str  # "file", "dir", "link", "other"
+    mode: int
+    uid: int
+    gid: int
+    payload: Optional[bytes]  # a file's bytes, a link's target
 
-    SAVED = [
-        "/etc/passwd",
-        "/etc/shadow",
-        "/etc/group",
-        "/etc/gshadow",
-        "/etc/vsftpd.conf",
-        "/etc/pam.d/vsftpd",
-        "/etc/pam.d/common-auth",
-        "/etc/pam.d/common-account",
-        "/etc/pam.d/common-session",
-        "/etc/ftpusers",
-        "/etc/vsftpd.user_list",
-    ]
+
+def capture(tops: List[str]) -> Dict[str, Entry]:
+    """Everything below the directories (themselves included), by path."""
+    entries: Dict[str, Entry] = {}
+
+    def add(path: str) -> None:
+        info = os.lstat(path)
+        kind, payload = "other", None
+        if stat.S_ISREG(info.st_mode):
+            kind = "file"
+            with open(path, "rb") as source:
+                payload = source.read()
+        elif stat.S_ISDIR(info.st_mode):
+            kind = "dir"
+        elif stat.S_ISLNK(info.st_mode):
+            kind, payload = "link", os.fsencode(os.readlink(path))
+        entries[path] = Entry(kind, stat.S_IMODE(info.st_mode), info.st_uid, info.st_gid, payload)
+
+    for top in tops:
+        add(top)
+        for directory, subdirectories, files in os.walk(top):
+            for name in subdirectories + files:
+                add(os.path.join(directory, name))
+    return entries
+
+
+def differences(before: Dict[str, Entry], after: Dict[str, Entry]) -> Dict[str, str]:
+    changed: Dict[str, str] = {}
+    for path in sorted(before.keys() | after.keys()):
+        old, new = before.get(path), after.get(path)
+        if old is None or new is None:
+            changed[path] = CREATED if old is None else REMOVED
+            continue
+        what = [CONTENT] if (old.kind, old.payload) != (new.kind, new.payload) else []
+        what += [MODE] if (old.mode, old.uid, old.gid) != (new.mode, new.uid, new.gid) else []
+        if what:
+            changed[path] = "+".join(what)
+    return changed
+
+
+def remove(path: str) -> None:
+    if os.path.isdir(path) and not os.path.islink(path):
+        shutil.rmtree(path)
+    elif os.path.lexists(path):
+        os.unlink(path)
+
+
+class EtcGuard:
+    """Puts /etc back exactly as it was when the guard was made, whatever a
+    scenario (or the program under test) wrote, made or removed below it."""
 
     def __init__(self) -> None:
-        self.saved: Dict[str, Optional[Tuple[bytes, os.stat_result]]] = {}
-        for path in self.SAVED:
-            try:
-                with open(path, "rb") as source:
-                    self.saved[path] = (source.read(), os.stat(path))
-            except FileNotFoundError:
-                self.saved[path] = None
-        self.created: List[str] = []
+        self.tree = capture(["/etc"])
 
-    def write(self, path: str, text: str, mode: int = 0o644) -> None:
+    @staticmethod
+    def write(path: str, text: str, mode: int = 0o644) -> None:
         """Root's, as a package would install it."""
         if not path.startswith("/etc/"):
             raise SetupError(f"{path} is not under /etc")
-        directory = os.path.dirname(path)
-        missing = []
-        while not os.path.exists(directory):
-            missing.append(directory)
-            directory = os.path.dirname(directory)
-        for directory in reversed(missing):
-            os.mkdir(directory, 0o755)
-            self.created.append(directory)
-        if path not in self.saved and not os.path.exists(path):
-            self.created.append(path)
+        os.makedirs(os.path.dirname(path), 0o755, exist_ok=True)
         with open(path, "w", encoding="utf-8") as target:
             target.write(text)
         os.chmod(path, mode)
         os.chown(path, 0, 0)
 
     def restore(self) -> None:
-        for path in reversed(self.created):
-            if os.path.isdir(path) and not os.path.islink(path):
-                shutil.rmtree(path, ignore_errors=True)
-            elif os.path.lexists(path):
-                os.unlink(path)
-        self.created.clear()
-        for path, saved in self.saved.items():
-            if saved is None:
-                if os.path.lexists(path):
-                    os.unlink(path)
+        now = capture(["/etc"])
+        for path in sorted(now.keys() - self.tree.keys(), reverse=True):
+            remove(path)
+        for path in sorted(self.tree):
+            old, new = self.tree[path], now.get(path)
+            if old.kind == "other":
                 continue
-            content, info = saved
-            with open(path, "wb") as target:
-                target.write(content)
-            os.chmod(path, info.st_mode & 0o7777)
-            os.chown(path, info.st_uid, info.st_gid)
+            if new is not None and new.kind != old.kind:
+                remove(path)
+                new = None
+            if old.kind == "dir" and new is None:
+                os.mkdir(path)
+            elif old.kind == "file" and (new is None or new.payload != old.payload):
+                with open(path, "wb") as target:
+                    target.write(old.payload or b"")
+            elif old.kind == "link" and (new is None or new.payload != old.payload):
+                if new is not None:
+                    os.unlink(path)
+                os.symlink(os.fsdecode(old.payload or b""), path)
+            if new is None or (old.mode, old.uid, old.gid) != (new.mode, new.uid, new.gid):
+                os.chown(path, old.uid, old.gid, follow_symlinks=False)
+                if old.kind != "link":
+                    os.chmod(path, old.mode)
 
+
+# Setting a scenario up ---------------------------------------------------------
 
 def names_in(path: str) -> set:
     with open(path, encoding="utf-8", errors="replace") as source:
@@ -276,10 +276,7 @@ def free_ids(count: int) -> List[int]:
     used = set()
     for path in ("/etc/passwd", "/etc/group"):
         with open(path, encoding="utf-8", errors="replace") as source:
-            for line in source:
-                fields = line.split(":")
-                if len(fields) > 2 and fields[2].isdigit():
-                    used.add(int(fields[2]))
+            used |= {int(f[2]) for f in (line.split(":") for line in source) if len(f) > 2 and f[2].isdigit()}
     ids: List[int] = []
     candidate = FIRST_ID
     while len(ids) < count:
@@ -298,9 +295,6 @@ def run_tool(command: List[str], stdin: str = "", timeout: int = 20) -> None:
         raise SetupError(f"{' '.join(command)} failed ({done.returncode}): {done.stderr.strip()}")
 
 
-# Setting a scenario up ---------------------------------------------------------
-
-
 def fill(text: str, tmp: str, port: int = 0) -> str:
     return text.replace("{tmp}", tmp).replace("{port}", str(port))
 
@@ -309,13 +303,13 @@ def key_of(line: str) -> str:
     return line.split("=", 1)[0]
 
 
-def conf_text(scenario: Setup, tmp: str, port: int) -> str:
+def conf_text(scenario: Scenario, tmp: str, port: int) -> str:
     base = [line for line in BASE_CONF if key_of(line) not in scenario.omit]
     return "".join(fill(line, tmp, port) + "\n" for line in base + scenario.conf)
 
 
-def add_accounts(scenario: Setup, tmp: str) -> None:
-    """Appends to /etc/passwd, /etc/shadow and /etc/group; EtcSnapshot puts them back."""
+def add_accounts(scenario: Scenario, tmp: str) -> None:
+    """Appends to /etc/passwd, /etc/shadow and /etc/group; EtcGuard puts them back."""
     accounts = list(scenario.accounts)
     if all(a.name != ANON_ACCOUNT.name for a in accounts):
         accounts.insert(0, ANON_ACCOUNT)
@@ -324,16 +318,12 @@ def add_accounts(scenario: Setup, tmp: str) -> None:
         for name in (account.group or account.name,) + account.groups:
             if name not in group_names:
                 group_names.append(name)
-    taken = names_in("/etc/passwd") | names_in("/etc/group")
-    clash = taken & ({a.name for a in accounts} | set(group_names))
+    clash = (names_in("/etc/passwd") | names_in("/etc/group")) & ({a.name for a in accounts} | set(group_names))
     if clash:
         raise SetupError(f"accounts or groups already on this machine: {sorted(clash)}")
     ids = free_ids(len(accounts) + len(group_names))
     gid = {name: ids[len(accounts) + i] for i, name in enumerate(group_names)}
-    members: Dict[str, List[str]] = {name: [] for name in group_names}
-    for account in accounts:
-        for name in account.groups:
-            members[name].append(account.name)
+    members: Dict[str, List[str]] = {name: [a.name for a in accounts if name in a.groups] for name in group_names}
 
     passwd_lines, shadow_lines = [], []
     for index, account in enumerate(accounts):
@@ -344,8 +334,7 @@ def add_accounts(scenario: Setup, tmp: str) -> None:
         # instead of /etc/shadow when the field is anything else.
         passwd_lines.append(f"{account.name}:x:{uid}:{primary}::{home}:{account.shell}\n")
         # A recent last change: a 0 there would force a password change.
-        expire = "1" if account.expired else ""
-        shadow_lines.append(f"{account.name}:!:19000:0:99999:7::{expire}:\n")
+        shadow_lines.append(f"{account.name}:!:19000:0:99999:7::{'1' if account.expired else ''}:\n")
         if account.home != "missing":
             os.makedirs(home, exist_ok=True)
             mode, owner, group = HOME_FORMS[account.home]
@@ -362,28 +351,26 @@ def add_accounts(scenario: Setup, tmp: str) -> None:
         run_tool([CHPASSWD], "".join(f"{a.name}:{password_of(a.name)}\n" for a in with_hash))
     # The other forms are written over what chpasswd left.
     by_name = {a.name: a for a in accounts}
-    rewrite_field("/etc/shadow", by_name, shadow_field)
-    rewrite_field("/etc/passwd", by_name, lambda account, old: account.passwd_field)
+    hashed = {"hash": lambda old: old, "!hash": lambda old: "!" + old}
+    rewrite_fields("/etc/shadow", {a.name: {1: hashed.get(a.shadow, lambda old, a=a: a.shadow)} for a in accounts})
+    rewrite_fields("/etc/passwd", {name: {1: lambda old, a=a: a.passwd} for name, a in by_name.items()})
+    aging = {user: {int(n): lambda old, v=v: v for n, v in f.items()} for user, f in scenario.shadow.items()}
+    rewrite_fields("/etc/shadow", aging)
 
 
-def shadow_field(account: Account, hashed: str) -> str:
-    if account.shadow == "hash":
-        return hashed
-    if account.shadow == "!hash":
-        return "!" + hashed
-    return account.shadow
-
-
-def rewrite_field(path: str, accounts: Dict[str, Account], value) -> None:
-    """Sets the password field of the accounts' lines to value(account, old)."""
+def rewrite_fields(path: str, changes: Dict[str, Dict[int, Callable[[str], str]]]) -> None:
+    """Sets field N of the lines of the named accounts to change(old value)."""
     with open(path, encoding="utf-8") as source:
         lines = source.read().splitlines(keepends=True)
+    seen = set()
     for index, line in enumerate(lines):
-        fields = line.split(":")
-        account = accounts.get(fields[0])
-        if account is not None and len(fields) > 1:
-            fields[1] = value(account, fields[1])
-            lines[index] = ":".join(fields)
+        fields = line.rstrip("\n").split(":")
+        for number, change in changes.get(fields[0], {}).items():
+            fields[number] = change(fields[number])
+            lines[index] = ":".join(fields) + "\n"
+            seen.add(fields[0])
+    if seen != {name for name, fields in changes.items() if fields}:
+        raise SetupError(f"{path} has no line for {sorted(set(changes) - seen)}")
     with open(path, "w", encoding="utf-8") as target:
         target.writelines(lines)
 
@@ -394,17 +381,16 @@ def under_tmp(path: str, tmp: str) -> str:
     return path
 
 
-def prepare(scenario: Setup, tmp: str, port: int, etc: EtcSnapshot) -> None:
+def prepare(scenario: Scenario, tmp: str, port: int) -> None:
     """Writes the scenario's accounts, configuration, PAM files, directories,
-    lists and databases; what it writes under /etc goes through `etc`."""
+    lists and databases."""
     os.makedirs(os.path.join(tmp, "empty"), 0o755, exist_ok=True)
     os.makedirs(os.path.join(tmp, "anon"), 0o755, exist_ok=True)
     add_accounts(scenario, tmp)
-    etc.write(CONF, conf_text(scenario, tmp, port))
+    EtcGuard.write(CONF, conf_text(scenario, tmp, port))
     for path, lines in COMMON_PAM.items():
-        etc.write(path, "".join(line + "\n" for line in lines))
-    pam = scenario.pam if scenario.pam is not None else DEBIAN_PAM
-    etc.write("/etc/pam.d/" + scenario.pam_service, "".join(fill(line, tmp) + "\n" for line in pam))
+        EtcGuard.write(path, "".join(line + "\n" for line in lines))
+    EtcGuard.write("/etc/pam.d/" + scenario.pam_service, "".join(fill(line, tmp) + "\n" for line in scenario.pam))
     # The directories first: a file may be put into one of them.
     for path in scenario.dirs:
         os.makedirs(under_tmp(fill(path, tmp), tmp), 0o755, exist_ok=True)
@@ -412,22 +398,19 @@ def prepare(scenario: Setup, tmp: str, port: int, etc: EtcSnapshot) -> None:
         path = fill(path, tmp)
         text = "".join(fill(line, tmp) + "\n" for line in lines)
         if path.startswith("/etc/"):
-            etc.write(path, text)
-        elif path.startswith(tmp + "/"):
-            os.makedirs(os.path.dirname(path), 0o755, exist_ok=True)
-            with open(path, "w", encoding="utf-8") as target:
-                target.write(text)
-            os.chmod(path, 0o644)
-            os.chown(path, 0, 0)
-        else:
-            raise SetupError(f"{path} is neither under /etc nor under the temporary directory")
+            EtcGuard.write(path, text)
+            continue
+        os.makedirs(os.path.dirname(under_tmp(path, tmp)), 0o755, exist_ok=True)
+        with open(path, "w", encoding="utf-8") as target:
+            target.write(text)
+        os.chmod(path, 0o644)
+        os.chown(path, 0, 0)
     for path, users in scenario.dbs.items():
         path = under_tmp(fill(path, tmp), tmp)
         run_tool([DB_LOAD, "-T", "-t", "hash", path], "".join(f"{u}\n{p}\n" for u, p in users.items()))
 
 
 # The server ----------------------------------------------------------------
-
 
 def free_port() -> int:
     with socket.socket(socket.AF_INET, socket.SOCK_STREAM) as probe:
@@ -460,11 +443,7 @@ class Vsftpd:
         # would be under inetd: give it the log, opened for writing.
         with open(self.log_path, "w+b") as log:
             self.process = subprocess.Popen(
-                [VSFTPD, CONF],
-                stdin=log,
-                stdout=log,
-                stderr=subprocess.STDOUT,
-                preexec_fn=die_with_parent,
+                [VSFTPD, CONF], stdin=log, stdout=log, stderr=subprocess.STDOUT, preexec_fn=die_with_parent
             )
         deadline = time.monotonic() + START_TIMEOUT
         while time.monotonic() < deadline:
@@ -484,8 +463,6 @@ class Vsftpd:
             if self.may_fail or banner.startswith("220"):
                 return True
             raise SetupError(f"unexpected greeting on port {self.port}: {banner.strip()!r}")
-        if self.may_fail:
-            raise SetupError(f"vsftpd neither answered on 127.0.0.1:{self.port} nor exited within {START_TIMEOUT}s")
         raise SetupError(f"vsftpd did not answer on 127.0.0.1:{self.port} within {START_TIMEOUT}s")
 
     def stop(self) -> None:
@@ -527,16 +504,14 @@ class Vsftpd:
 def children_of(parent: int) -> List[int]:
     """Children of the process, zombies included."""
     children = []
-    for entry in os.listdir("/proc"):
-        if not entry.isdigit():
-            continue
+    for entry in filter(str.isdigit, os.listdir("/proc")):
         try:
             with open(f"/proc/{entry}/stat", encoding="latin-1") as source:
-                stat = source.read()
+                stat_line = source.read()
         except OSError:
             continue
         # After the command name (which may hold blanks): state, ppid.
-        fields = stat[stat.rfind(")") + 2 :].split()
+        fields = stat_line[stat_line.rfind(")") + 2 :].split()
         if len(fields) > 1 and fields[1] == str(parent):
             children.append(int(entry))
     return children
@@ -552,19 +527,19 @@ def reap_children() -> None:
             return
 
 
+def prctl(option: int, value: int) -> int:
+    return ctypes.CDLL(None, use_errno=True).prctl(option, value, 0, 0, 0)
+
+
 def die_with_parent() -> None:
     """In the child before exec: should this script be killed (a ctest
     timeout), the server gets SIGTERM instead of listening on."""
-    libc = ctypes.CDLL(None, use_errno=True)
-    pr_set_pdeathsig = 1
-    libc.prctl(pr_set_pdeathsig, signal.SIGTERM, 0, 0, 0)
+    prctl(1, signal.SIGTERM)  # PR_SET_PDEATHSIG
 
 
 def become_subreaper() -> None:
     """Orphaned descendants (vsftpd sessions) become our children, not init's."""
-    libc = ctypes.CDLL(None, use_errno=True)
-    pr_set_child_subreaper = 36
-    if libc.prctl(pr_set_child_subreaper, 1, 0, 0, 0) != 0:
+    if prctl(36, 1) != 0:  # PR_SET_CHILD_SUBREAPER
         raise OSError(ctypes.get_errno(), "prctl(PR_SET_CHILD_SUBREAPER)")
 
 
@@ -575,9 +550,7 @@ CLOSED = (EOFError, ConnectionResetError, BrokenPipeError)
 
 
 def refusal(error: BaseException) -> str:
-    if isinstance(error, ftplib.error_perm):
-        return str(error)
-    return f"connection closed: {error!r}"
+    return str(error) if isinstance(error, ftplib.error_perm) else f"connection closed: {error!r}"
 
 
 def log_in(
@@ -632,7 +605,7 @@ def try_login(port: int, user: str, password: str, greeting_may_refuse: bool = F
     return ALLOWED, reply
 
 
-def credentials(scenario: Setup, user: str) -> Tuple[str, str]:
+def credentials(scenario: Scenario, user: str) -> Tuple[str, str]:
     """The name and the right password a scenario's user logs in with."""
     if user == ANONYMOUS:
         return ANONYMOUS, "e2e@example.org"
@@ -644,13 +617,11 @@ def credentials(scenario: Setup, user: str) -> Tuple[str, str]:
 
 # The report ----------------------------------------------------------------
 
-
 def run_report(report: str, tmp: str, *form: str) -> subprocess.CompletedProcess:
     """ftpconfig-report on the system root, its output captured."""
-    env = dict(os.environ)
     # Settings of an operator's own session (a stored "skip_pam_check")
     # must not change the answers.
-    env["XDG_CONFIG_HOME"] = os.path.join(tmp, "xdg")
+    env = dict(os.environ, XDG_CONFIG_HOME=os.path.join(tmp, "xdg"))
     try:
         return subprocess.run(
             [report, "--root", "/", *form], capture_output=True, text=True, timeout=REPORT_TIMEOUT, env=env
@@ -661,19 +632,9 @@ def run_report(report: str, tmp: str, *form: str) -> subprocess.CompletedProcess
 
 # The run -------------------------------------------------------------------
 
-
-def arguments(description: str, option: str, program: str) -> Tuple[str, Optional[List[str]]]:
-    """(the program named by `option`, the scenarios asked for or None)."""
-    parser = argparse.ArgumentParser(description=description)
-    parser.add_argument(option, required=True, help=program)
-    parser.add_argument("--scenario", action="append", help="run only this scenario (repeatable)")
-    args = parser.parse_args()
-    return getattr(args, option.lstrip("-").replace("-", "_")), args.scenario
-
-
-def check_names_and_keys(table: Sequence[Setup]) -> None:
+def check_names_and_keys(table: Sequence[Scenario]) -> None:
     """Slips every table can make: a name twice, a key the base
-    configuration sets already."""
+    configuration sets already, an account that cannot be read."""
     base_keys = {key_of(line) for line in BASE_CONF}
     names = set()
     for scenario in table:
@@ -683,46 +644,64 @@ def check_names_and_keys(table: Sequence[Setup]) -> None:
         clash = base_keys & {key_of(line) for line in scenario.conf} - set(scenario.omit)
         if clash:
             raise SystemExit(f"scenario {scenario.name} sets keys of the base configuration: {sorted(clash)}")
+        for account in scenario.accounts:
+            if account.home not in HOME_FORMS and account.home != "missing":
+                raise SystemExit(f"scenario {scenario.name}: unknown home form {account.home!r}")
 
 
 def may_run(script: str, program: str, tools: Sequence[str]) -> bool:
     """Whether the machine lets the script run; it says why not."""
     private, why = etc_is_private()
+    problem = ""
     if not private:
-        print(
-            f"{script}: refusing to run: {why}. It writes to /etc; run it through "
-            "scripts/with-private-etc.sh, which gives it a private copy of /etc.",
-            file=sys.stderr,
+        problem = (
+            f"refusing to run: {why}. It writes to /etc; run it through "
+            "scripts/with-private-etc.sh, which gives it a private copy of /etc."
         )
-        return False
-    if os.geteuid() != 0:
-        print(f"{script}: must run as root (it adds accounts and starts vsftpd)", file=sys.stderr)
-        return False
-    for tool in tools:
-        if shutil.which(tool) is None:
-            print(f"{script}: {tool} is not installed", file=sys.stderr)
-            return False
-    if not os.access(program, os.X_OK):
-        print(f"{script}: {program} is not an executable program", file=sys.stderr)
-        return False
-    return True
+    elif os.geteuid() != 0:
+        problem = "must run as root (it adds accounts and starts vsftpd)"
+    elif any(shutil.which(tool) is None for tool in tools):
+        problem = f"{[t for t in tools if shutil.which(t) is None][0]} is not installed"
+    elif not os.access(program, os.X_OK):
+        problem = f"{program} is not an executable program"
+    if problem:
+        print(f"{script}: {problem}", file=sys.stderr)
+    return not problem
 
 
-def run_all(
+def main(
     script: str,
-    table: Sequence[Setup],
-    selected: Optional[List[str]],
-    prefix: str,
-    run_one: Callable[[Setup, str], bool],
-) -> Optional[Tuple[int, int]]:
-    """Runs the selected scenarios (all without a selection), each in a
-    temporary directory of its own made with `prefix`, until RUN_DEADLINE:
-    (passed, failed), or None when none was selected."""
-    become_subreaper()
-    scenarios = [s for s in table if not selected or s.name in selected]
+    doc: str,
+    option: str,
+    tools: Sequence[str],
+    defaults: dict,
+    check_table: Callable[[List[Scenario]], None],
+    run_one: Callable[[Scenario, str, str], bool],
+    summary: Callable[[], str] = str,
+) -> int:
+    """The whole of a script's run: its options (the program it tests, named
+    by `option`, and --scenario), the checks of the machine and of its
+    table, then run_one(scenario, program, tmp) for each scenario selected,
+    each in a temporary directory of its own and with /etc put back after
+    it, until RUN_DEADLINE; and the line "N passed, M failed" with what
+    summary() adds. The exit status."""
+    parser = argparse.ArgumentParser(description=doc.splitlines()[0])
+    parser.add_argument(option, required=True, help="the program under test")
+    parser.add_argument("--scenario", action="append", help="run only this scenario (repeatable)")
+    args = parser.parse_args()
+    program = getattr(args, option.lstrip("-"))
+    name = os.path.basename(script)
+    if not may_run(name, program, tools):
+        return 2
+    table = load_table(script, defaults)
+    check_names_and_keys(table)
+    check_table(table)
+    scenarios = [s for s in table if not args.scenario or s.name in args.scenario]
     if not scenarios:
-        print(f"{script}: no scenario selected", file=sys.stderr)
-        return None
+        print(f"{name}: no scenario selected", file=sys.stderr)
+        return 2
+    become_subreaper()
+    guard = EtcGuard()
     passed = failed = 0
     deadline = time.monotonic() + RUN_DEADLINE
     for scenario in scenarios:
@@ -730,42 +709,16 @@ def run_all(
             print(f"{scenario.name}: ERROR not run, the run took longer than {RUN_DEADLINE}s")
             failed += 1
             continue
-        tmp = tempfile.mkdtemp(prefix=prefix)
+        tmp = tempfile.mkdtemp(prefix="ftpconfig-e2e-")
         try:
             # Accounts must reach their homes below it.
             os.chmod(tmp, 0o755)
-            if run_one(scenario, tmp):
+            if run_one(scenario, program, tmp):
                 passed += 1
             else:
                 failed += 1
         finally:
+            guard.restore()
             shutil.rmtree(tmp, ignore_errors=True)
-    return passed, failed
-
-
-def main(
-    script: str,
-    doc: str,
-    option: str,
-    program_help: str,
-    tools: Sequence[str],
-    table: Sequence[Setup],
-    check_table: Callable[[], None],
-    prefix: str,
-    run_one: Callable[[Setup, str, str], bool],
-    summary: Callable[[], str] = str,
-) -> int:
-    """The whole of a script's run: its options (the program it tests, named
-    by `option`, and --scenario), the checks of the machine and of the
-    table, then run_one(scenario, program, tmp) for each scenario, and the
-    line "N passed, M failed" with what summary() adds. The exit status."""
-    program, selected = arguments(doc.splitlines()[0], option, program_help)
-    if not may_run(script, program, tools):
-        return 2
-    check_table()
-    counts = run_all(script, table, selected, prefix, lambda scenario, tmp: run_one(scenario, program, tmp))
-    if counts is None:
-        return 2
-    passed, failed = counts
     print(f"{passed} passed, {failed} failed{summary()}")
     return 0 if failed == 0 else 1
