@@ -2,8 +2,8 @@
 // nothing changed, with every per-user file changed, and with virtual users
 // added. Usage: benchsave [virtual-users] [per-user-files] [added-users]
 #include "BenchSupport.h"
-#include "report/AccessReport.h"
 #include "policy/FtpServerConfig.h"
+#include "report/AccessReport.h"
 
 #include <QCoreApplication>
 #include <QDir>

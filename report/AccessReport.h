@@ -1,8 +1,8 @@
 #pragma once
 
+#include "forecast/LoginForecast.h"
 #include "policy/AccessFailure.h"
 #include "policy/Interaction.h"
-#include "forecast/LoginForecast.h"
 
 #include <QByteArray>
 #include <QList>

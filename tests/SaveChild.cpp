@@ -1,8 +1,8 @@
 // Loads a root, changes a little of everything and saves it: the process
 // the crash test kills in the middle of its save. Prints "SAVING" just
 // before the save begins and "SAVED" once it is done.
-#include "report/AccessReport.h"
 #include "policy/FtpServerConfig.h"
+#include "report/AccessReport.h"
 
 #include <QCoreApplication>
 
