@@ -8,6 +8,7 @@
 #include "policy/FtpServerConfig.h"
 #include "ui_CMainWindow.h"
 #include "usertable/CMainTreeView.h"
+#include "usertable/CreateVUserDialog.h"
 #include "usertable/CUsersFilterProxyModel.h"
 #include "usertable/TreeModel.h"
 
@@ -17,6 +18,7 @@
 #include <QDialogButtonBox>
 #include <QHeaderView>
 #include <QLabel>
+#include <QLineEdit>
 #include <QMenu>
 #include <QMessageBox>
 #include <QPixmap>
@@ -26,6 +28,7 @@
 
 #include <cstdio>
 #include <exception>
+#include <optional>
 
 namespace {
 
@@ -233,13 +236,10 @@ void CMainWindow::connectActions()
     connect(m_ui->actionOptions, &QAction::triggered, this, &CMainWindow::showSettingsDialog);
     connect(m_view, &CMainTreeView::selected, this, &CMainWindow::viewElementActivated);
 
-    // Neither the virtual user dialogs nor the options dialog are part of
-    // the program yet: their actions say so instead of doing nothing.
-    const QString missing = tr("Not available in this version");
-    for (QAction *action : {m_ui->actionAdd_user, m_ui->actionEdit_user, m_ui->actionOptions}) {
-        action->setEnabled(false);
-        action->setToolTip(missing);
-    }
+    // The options dialog is not part of the program yet: its action says
+    // so instead of doing nothing.
+    m_ui->actionOptions->setEnabled(false);
+    m_ui->actionOptions->setToolTip(tr("Not available in this version"));
 }
 
 TreeModel *CMainWindow::model() const
@@ -325,16 +325,87 @@ QModelIndex CMainWindow::currentSourceIndex() const
     return m_proxy->mapToSource(m_view->currentIndex());
 }
 
+namespace {
+
+// A virtual user that is still there: a deleted one waits for the save and
+// may be added again. Its password, or nothing.
+std::optional<QByteArray> livePassword(const FtpServerConfig &config, const QByteArray &name)
+{
+    const auto &users = config.accounts().virtualUsers();
+    const auto found = users.find(name);
+    if (found == users.end() || found->second.state == VirtualUserState::Deleted)
+        return std::nullopt;
+    return found->second.password;
+}
+
+} // namespace
+
+bool CMainWindow::runVirtualUserDialog(CreateVUserDialog &dialog)
+{
+    for (QLineEdit *field : {dialog.nameLineEdit(), dialog.passwordLineEdit(), dialog.confirmationLineEdit()})
+        connect(field, &QLineEdit::textEdited, this, &CMainWindow::enableVirtualUserOkButton);
+    dialog.buttonBox()->button(QDialogButtonBox::Ok)->setEnabled(false);
+    m_virtualUserButtonBox = dialog.buttonBox();
+    const bool accepted = dialog.run();
+    m_virtualUserButtonBox = nullptr;
+    return accepted;
+}
+
+void CMainWindow::showVirtualUser(const QString &name)
+{
+    m_view->expandAll();
+    m_view->setCurrentIndex(m_proxy->mapFromSource(m_model->indexOfUser(name)));
+    viewElementActivated(m_view->currentIndex());
+}
+
 void CMainWindow::addUser()
 {
-    // Entry point of the "new virtual user" dialog; the action stays
-    // disabled until the dialog exists.
+    CreateVUserDialog dialog(this);
+    if (!runVirtualUserDialog(dialog))
+        return;
+    const QByteArray name = dialog.userName().toUtf8();
+    if (livePassword(m_model->config(), name)) {
+        QMessageBox::warning(this, windowTitle(),
+                             tr("User %1 allready exists in users database.").arg(dialog.userName()));
+        return;
+    }
+    m_model->addVirtualUser(name, dialog.password().toUtf8());
+    showVirtualUser(dialog.userName());
 }
 
 void CMainWindow::editUser()
 {
-    // Entry point of the "edit virtual user" dialog; the action stays
-    // disabled until the dialog exists.
+    const QModelIndex source = currentSourceIndex();
+    // The shortcut reaches here whatever the row: only a virtual user is
+    // edited.
+    if (!m_model->isInVirtualGroup(source)) {
+        QMessageBox::warning(this, windowTitle(), tr("Please, select virtual user which has to be changed."));
+        return;
+    }
+    const QString oldName = m_model->userName(source);
+    const auto oldPassword = livePassword(m_model->config(), oldName.toUtf8());
+    if (!oldPassword) {
+        QMessageBox::warning(this, windowTitle(),
+                             tr("Unable to find information about virtual user %1 in database.").arg(oldName));
+        return;
+    }
+    CreateVUserDialog dialog(this);
+    dialog.setUser(oldName, QString::fromUtf8(*oldPassword));
+    if (!runVirtualUserDialog(dialog))
+        return;
+    const QByteArray name = dialog.userName().toUtf8();
+    const QByteArray password = dialog.password().toUtf8();
+    if (name == oldName.toUtf8() && password == *oldPassword)
+        return;
+    if (name != oldName.toUtf8() && livePassword(m_model->config(), name)) {
+        QMessageBox::warning(this, windowTitle(),
+                             tr("User %1 allready exists in users database.").arg(dialog.userName()));
+        return;
+    }
+    // A new name moves the record: the save deletes the old key and writes
+    // the new one.
+    m_model->changeVirtualUser(oldName.toUtf8(), name, password);
+    showVirtualUser(dialog.userName());
 }
 
 void CMainWindow::deleteUser()

@@ -8,6 +8,7 @@
 #include <memory>
 
 class CMainTreeView;
+class CreateVUserDialog;
 class CUsersFilterProxyModel;
 class GuiInteraction;
 class LoginCheckDock;
@@ -72,6 +73,11 @@ private:
     // still shown.
     void refilterKeepingCurrent(void (CUsersFilterProxyModel::*setHidden)(bool), bool hide);
     QModelIndex currentSourceIndex() const;
+    // Runs the virtual user dialog with its Ok button held back until the
+    // first edit; true when it holds a name and password to store.
+    bool runVirtualUserDialog(CreateVUserDialog &dialog);
+    // Expands the table and makes the user's row the current one.
+    void showVirtualUser(const QString &name);
 
     std::unique_ptr<Ui::CMainWindow> m_ui;
     Server &m_server;
