@@ -7,9 +7,12 @@
 #include "dialogs/GuiInteraction.h"
 #include "policy/FtpServerConfig.h"
 #include "ui_CMainWindow.h"
+#include "usertable/CDirSelectorDelegate.h"
 #include "usertable/CMainTreeView.h"
-#include "usertable/CreateVUserDialog.h"
+#include "usertable/CPermissionDelegate.h"
+#include "usertable/CUsermodeDelegate.h"
 #include "usertable/CUsersFilterProxyModel.h"
+#include "usertable/CreateVUserDialog.h"
 #include "usertable/TreeModel.h"
 
 #include <QCloseEvent>
@@ -184,10 +187,10 @@ void CMainWindow::restoreWindowState()
 
 void CMainWindow::installDelegates()
 {
-    // The cell editors of the status, directory and mode columns
-    // (CUsermodeDelegate, CDirSelectorDelegate, CPermissionDelegate) are
-    // installed here with setItemDelegateForColumn; until they exist the
-    // view edits those cells with its default line editor.
+    m_view->setItemDelegateForColumn(TreeModel::StatusColumn, new CUsermodeDelegate(m_view));
+    m_view->setItemDelegateForColumn(TreeModel::DirectoryColumn,
+                                     new CDirSelectorDelegate(this, &m_model->config(), m_view));
+    m_view->setItemDelegateForColumn(TreeModel::ModeColumn, new CPermissionDelegate(m_view));
 }
 
 void CMainWindow::createFilterMenu()

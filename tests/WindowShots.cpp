@@ -2,11 +2,12 @@
 // does, and saves pictures into the directory named on the command line:
 // the window with a refused user selected, its filter menu, the refusal box
 // of an edit that cannot be repaired, the PAM problem dialog over the
-// window, and the Login check dock.
+// window, the Login check dock, and the permissions editor.
 #include "ModalHelper.h"
 #include "app/CMainWindow.h"
 #include "app/LoginCheckDock.h"
 #include "app/VexIntegration.h"
+#include "common/AppStrings.h"
 #include "dialogs/GuiInteraction.h"
 #include "usertable/CMainTreeView.h"
 #include "usertable/CUsersFilterProxyModel.h"
@@ -101,6 +102,14 @@ int main(int argc, char **argv)
         ModalHelper::press(dialog, QStringLiteral("Skip"));
     });
     GuiInteraction().askPamProblem();
+
+    // The mode cell's editor over the window, on the anonymous row.
+    modal.expect(QStringLiteral("Dialog"), [&](QWidget *dialog) {
+        save(dialog, QStringLiteral("permissions-editor"));
+        ModalHelper::press(dialog, QStringLiteral("Cancel"));
+    });
+    window.view()->edit(
+        window.proxy()->mapFromSource(userIndex(model, AppStrings::instance().anonymousUsers, TreeModel::ModeColumn)));
 
     if (!modal.done()) {
         std::fprintf(stderr, "%s\n", qPrintable(modal.report()));
