@@ -37,34 +37,13 @@ QString describe(const std::map<QByteArray, VirtualUserRecord> &users)
 QString dumped(const QString &file)
 {
     const ProcessResult result = runProcess(QStringLiteral("db5.3_dump"), {QStringLiteral("-p"), file});
-    if (result.exitCode != 0)
-        return QStringLiteral("dump failed: ") + QString::fromUtf8(result.err);
-    const QList<QByteArray> lines = result.out.split('\n');
+    if (result.exitCode != 0 || !result.out.contains("\ntype=hash\n"))
+        return QStringLiteral("no hash database: ") + QString::fromUtf8(result.err + result.out);
+    // After the header, printable lines start with a blank: a key, then its value.
+    const QList<QByteArray> lines = result.out.mid(result.out.indexOf("HEADER=END\n") + 11).split('\n');
     QMap<QString, QString> records;
-    bool inData = false;
-    QString key;
-    bool haveKey = false;
-    for (const QByteArray &line : lines) {
-        if (line == "HEADER=END") {
-            inData = true;
-            continue;
-        }
-        if (line == "DATA=END")
-            break;
-        if (!inData) {
-            if (line.startsWith("type=") && line != "type=hash")
-                return QStringLiteral("not a hash: ") + QString::fromUtf8(line);
-            continue;
-        }
-        const QString text = QString::fromUtf8(line.mid(1)); // printable lines start with a blank
-        if (!haveKey) {
-            key = text;
-            haveKey = true;
-        } else {
-            records.insert(key, text);
-            haveKey = false;
-        }
-    }
+    for (int i = 0; i + 1 < lines.size() && lines[i].startsWith(' '); i += 2)
+        records.insert(QString::fromUtf8(lines[i].mid(1)), QString::fromUtf8(lines[i + 1].mid(1)));
     QStringList parts;
     for (auto it = records.begin(); it != records.end(); ++it)
         parts << it.key() + QLatin1Char('=') + it.value();

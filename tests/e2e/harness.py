@@ -13,6 +13,7 @@ import copy
 import ctypes
 import dataclasses
 import ftplib
+import itertools
 import os
 import shutil
 import signal
@@ -144,6 +145,7 @@ def load_table(script: str, defaults: dict) -> List[Scenario]:
 
 # Guards -------------------------------------------------------------------
 
+
 def etc_is_private() -> Tuple[bool, str]:
     if os.environ.get("FTPCONFIG_PRIVATE_ETC") != "1":
         return False, "FTPCONFIG_PRIVATE_ETC=1 is not set"
@@ -266,6 +268,7 @@ class EtcGuard:
 
 # Setting a scenario up ---------------------------------------------------------
 
+
 def names_in(path: str) -> set:
     with open(path, encoding="utf-8", errors="replace") as source:
         return {line.split(":", 1)[0] for line in source if ":" in line}
@@ -277,13 +280,7 @@ def free_ids(count: int) -> List[int]:
     for path in ("/etc/passwd", "/etc/group"):
         with open(path, encoding="utf-8", errors="replace") as source:
             used |= {int(f[2]) for f in (line.split(":") for line in source) if len(f) > 2 and f[2].isdigit()}
-    ids: List[int] = []
-    candidate = FIRST_ID
-    while len(ids) < count:
-        if candidate not in used:
-            ids.append(candidate)
-        candidate += 1
-    return ids
+    return list(itertools.islice((i for i in itertools.count(FIRST_ID) if i not in used), count))
 
 
 def run_tool(command: List[str], stdin: str = "", timeout: int = 20) -> None:
@@ -313,11 +310,7 @@ def add_accounts(scenario: Scenario, tmp: str) -> None:
     accounts = list(scenario.accounts)
     if all(a.name != ANON_ACCOUNT.name for a in accounts):
         accounts.insert(0, ANON_ACCOUNT)
-    group_names: List[str] = []
-    for account in accounts:
-        for name in (account.group or account.name,) + account.groups:
-            if name not in group_names:
-                group_names.append(name)
+    group_names = list(dict.fromkeys(name for a in accounts for name in (a.group or a.name,) + a.groups))
     clash = (names_in("/etc/passwd") | names_in("/etc/group")) & ({a.name for a in accounts} | set(group_names))
     if clash:
         raise SetupError(f"accounts or groups already on this machine: {sorted(clash)}")
@@ -411,6 +404,7 @@ def prepare(scenario: Scenario, tmp: str, port: int) -> None:
 
 
 # The server ----------------------------------------------------------------
+
 
 def free_port() -> int:
     with socket.socket(socket.AF_INET, socket.SOCK_STREAM) as probe:
@@ -617,6 +611,7 @@ def credentials(scenario: Scenario, user: str) -> Tuple[str, str]:
 
 # The report ----------------------------------------------------------------
 
+
 def run_report(report: str, tmp: str, *form: str) -> subprocess.CompletedProcess:
     """ftpconfig-report on the system root, its output captured."""
     # Settings of an operator's own session (a stored "skip_pam_check")
@@ -631,6 +626,7 @@ def run_report(report: str, tmp: str, *form: str) -> subprocess.CompletedProcess
 
 
 # The run -------------------------------------------------------------------
+
 
 def check_names_and_keys(table: Sequence[Scenario]) -> None:
     """Slips every table can make: a name twice, a key the base
