@@ -4,10 +4,12 @@
 #include "ModalHelper.h"
 #include "dialogs/GuiInteraction.h"
 #include "policy/FtpServerConfig.h"
+#include "usertable/CreateVUserDialog.h"
 
 #include <QAbstractButton>
 #include <QApplication>
 #include <QDir>
+#include <QLineEdit>
 #include <QMessageBox>
 
 #include <cstdio>
@@ -94,6 +96,13 @@ int main(int argc, char **argv)
     permissions.buttons = {Interaction::Button::Yes, Interaction::Button::No};
     modal.expect(permissions.message.text, shot(QStringLiteral("permissions-question"), QStringLiteral("No")));
     gui.ask(permissions);
+
+    CreateVUserDialog virtualUser;
+    virtualUser.nameLineEdit()->setText(QStringLiteral("eve"));
+    virtualUser.passwordLineEdit()->setText(QStringLiteral("secret"));
+    virtualUser.confirmationLineEdit()->setText(QStringLiteral("secret"));
+    modal.expect(virtualUser.windowTitle(), shot(QStringLiteral("virtual-user-dialog"), QStringLiteral("Cancel")));
+    virtualUser.run();
 
     if (!modal.done()) {
         std::fprintf(stderr, "%s\n", qPrintable(modal.report()));
