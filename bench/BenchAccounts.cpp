@@ -36,10 +36,10 @@ int main(int argc, char **argv)
     for (int g = 0; g < 1000; ++g)
         group += "group" + QByteArray::number(g) + ":x:" + QByteArray::number(10000 + g) + ":user"
             + QByteArray::number(g) + ",user" + QByteArray::number(g + 1000) + "\n";
-    writeBenchFile(root + "/etc/passwd", passwd);
-    writeBenchFile(root + "/etc/shadow", shadow);
-    writeBenchFile(root + "/etc/group", group);
-    const QString dbFile = root + "/var/lib/ftpconfig/vsftpd_virtual_users.db";
+    writeBenchFile(root + QLatin1String("/etc/passwd"), passwd);
+    writeBenchFile(root + QLatin1String("/etc/shadow"), shadow);
+    writeBenchFile(root + QLatin1String("/etc/group"), group);
+    const QString dbFile = root + QLatin1String("/var/lib/ftpconfig/vsftpd_virtual_users.db");
     const double loadMs = loadBenchDatabase(dbFile, virtualUserPairs(virtualUsers));
 
     double bestRw = 1e12, bestRo = 1e12, bestDump = 1e12;
@@ -58,7 +58,10 @@ int main(int argc, char **argv)
                                AccountStore::Access::ReadOnly);
             bestRo = std::min(bestRo, timer.nsecsElapsed() / 1e6);
         }
-        bestDump = std::min(bestDump, runBenchProgram("db5.3_dump", {"-p", "-f", "/dev/null", dbFile}));
+        bestDump = std::min(
+            bestDump,
+            runBenchProgram(QStringLiteral("db5.3_dump"),
+                            {QStringLiteral("-p"), QStringLiteral("-f"), QStringLiteral("/dev/null"), dbFile}));
     }
     std::printf("accounts %d, virtual users %d, records loaded %zu, db file %lld bytes (db5.3_load %.0f ms)\n",
                 accounts, virtualUsers, loaded, static_cast<long long>(QFileInfo(dbFile).size()), loadMs);

@@ -38,19 +38,20 @@ int main(int argc, char **argv)
     QByteArray passwd = "root:x:0:0::/root:/bin/sh\nftp:x:107:113::/srv/ftp:/usr/sbin/nologin\n";
     for (int i = 0; i < perUserFiles; ++i) {
         passwd += "user" + QByteArray::number(i) + ":x:" + QByteArray::number(10000 + i) + ":1000::/home/u:/bin/sh\n";
-        writeBenchFile(root + "/etc/vsftpd.d/users.d/user" + QString::number(i),
+        writeBenchFile(root + QLatin1String("/etc/vsftpd.d/users.d/user") + QString::number(i),
                        "# per-user settings\nlocal_root=/srv/user" + QByteArray::number(i) + "\ndownload_enable=YES\n");
     }
-    writeBenchFile(root + "/etc/passwd", passwd);
-    writeBenchFile(root + "/etc/shadow", "");
-    writeBenchFile(root + "/etc/group", "users:x:1000:\n");
-    writeBenchFile(root + "/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nguest_enable=YES\nuserlist_enable=YES\n");
-    writeBenchFile(root + "/etc/vsftpd.d/allowed_user_list.conf", "");
-    writeBenchFile(root + "/etc/vsftpd.chroot_list", "");
-    writeBenchFile(root + "/etc/pam.d/vsftpd",
+    writeBenchFile(root + QLatin1String("/etc/passwd"), passwd);
+    writeBenchFile(root + QLatin1String("/etc/shadow"), "");
+    writeBenchFile(root + QLatin1String("/etc/group"), "users:x:1000:\n");
+    writeBenchFile(root + QLatin1String("/etc/vsftpd.conf"),
+                   "listen=YES\nlocal_enable=YES\nguest_enable=YES\nuserlist_enable=YES\n");
+    writeBenchFile(root + QLatin1String("/etc/vsftpd.d/allowed_user_list.conf"), "");
+    writeBenchFile(root + QLatin1String("/etc/vsftpd.chroot_list"), "");
+    writeBenchFile(root + QLatin1String("/etc/pam.d/vsftpd"),
                    "auth sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
                    "account sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n");
-    loadBenchDatabase(root + "/var/lib/ftpconfig/users.db", virtualUserPairs(virtualUsers));
+    loadBenchDatabase(root + QLatin1String("/var/lib/ftpconfig/users.db"), virtualUserPairs(virtualUsers));
 
     std::ostringstream quiet;
     std::streambuf *out = std::cout.rdbuf(quiet.rdbuf());

@@ -49,5 +49,6 @@ inline QByteArray virtualUserPairs(int count)
 inline double loadBenchDatabase(const QString &file, const QByteArray &pairs)
 {
     QDir().mkpath(QFileInfo(file).absolutePath());
-    return runBenchProgram(QStringLiteral("db5.3_load"), {"-T", "-t", "hash", file}, pairs);
+    return runBenchProgram(QStringLiteral("db5.3_load"),
+                           {QStringLiteral("-T"), QStringLiteral("-t"), QStringLiteral("hash"), file}, pairs);
 }

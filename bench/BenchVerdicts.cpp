@@ -54,27 +54,27 @@ void generate(const QString &root, const Sizes &sizes)
     for (int i = 0; i < sizes.userlist; ++i)
         userlist += "user" + QByteArray::number(i * 3) + "\n";
 
-    writeBenchFile(root + "/etc/passwd", passwd);
-    writeBenchFile(root + "/etc/shadow", shadow);
-    writeBenchFile(root + "/etc/group", group);
+    writeBenchFile(root + QLatin1String("/etc/passwd"), passwd);
+    writeBenchFile(root + QLatin1String("/etc/shadow"), shadow);
+    writeBenchFile(root + QLatin1String("/etc/group"), group);
     // The userlist doubles as the chroot list: the forecast looks every
     // user up in both.
-    writeBenchFile(root + "/etc/vsftpd.conf",
+    writeBenchFile(root + QLatin1String("/etc/vsftpd.conf"),
                    "listen=YES\nlocal_enable=YES\nguest_enable=YES\nuserlist_enable=YES\n"
                    "userlist_file=/etc/vsftpd.d/allowed_user_list.conf\nchroot_list_enable=YES\n"
                    "chroot_list_file=/etc/vsftpd.d/allowed_user_list.conf\n");
-    writeBenchFile(root + "/etc/pam.d/vsftpd",
+    writeBenchFile(root + QLatin1String("/etc/pam.d/vsftpd"),
                    "auth sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
                    "account sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"
                    "auth required pam_listfile.so item=user sense=deny file=/etc/ftpusers\n"
                    "@include common-auth\n");
-    writeBenchFile(root + "/etc/ftpusers", "root\nuser7\n");
-    writeBenchFile(root + "/etc/vsftpd.d/allowed_user_list.conf", userlist);
-    QDir().mkpath(root + "/srv/ftp");
-    QDir().mkpath(root + "/var/run/vsftpd/empty");
-    writeBenchFile(root + "/etc/shells", "/bin/sh\n/bin/bash\n");
-    QDir().mkpath(root + "/etc/vsftpd.d/users.d");
-    loadBenchDatabase(root + "/var/lib/ftpconfig/users.db", virtualUserPairs(sizes.virtualUsers));
+    writeBenchFile(root + QLatin1String("/etc/ftpusers"), "root\nuser7\n");
+    writeBenchFile(root + QLatin1String("/etc/vsftpd.d/allowed_user_list.conf"), userlist);
+    QDir().mkpath(root + QLatin1String("/srv/ftp"));
+    QDir().mkpath(root + QLatin1String("/var/run/vsftpd/empty"));
+    writeBenchFile(root + QLatin1String("/etc/shells"), "/bin/sh\n/bin/bash\n");
+    QDir().mkpath(root + QLatin1String("/etc/vsftpd.d/users.d"));
+    loadBenchDatabase(root + QLatin1String("/var/lib/ftpconfig/users.db"), virtualUserPairs(sizes.virtualUsers));
 }
 
 double ms(const QElapsedTimer &timer)
