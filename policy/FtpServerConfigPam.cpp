@@ -81,7 +81,9 @@ bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, A
                 m_skipPamCheck = true;
                 return true;
             }
-            return fixPamUserdb();
+            // A fix that was cancelled or failed counts as Skip: asked once.
+            m_pamSkipped = !fixPamUserdb();
+            return !m_pamSkipped;
         }
 
         for (auto argument = std::next(module); argument != line->tokens.end(); ++argument) {

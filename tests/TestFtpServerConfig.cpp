@@ -272,11 +272,12 @@ void TestFtpServerConfig::pamUserdb()
     QCOMPARE(QSettings().value(QStringLiteral("skip_pam_check"), false).toBool(), skipAfter);
     // Local users are never looked at.
     QVERIFY(engine.config->checkPamUserdb("bob", interactive, nullptr));
-    // Valid never asks again; Skip asks no more in this run.
-    if (skipAfter || scenario.values(QStringLiteral("answer")).contains(QStringLiteral("pam:skip"))) {
-        const int asked = engine.interaction.records.size();
+    // Valid never asks again; Skip, or a fix not made, asks no more in this run.
+    const bool asked = !scenario.values(QStringLiteral("answer")).filter(QStringLiteral("pam:")).isEmpty();
+    if (skipAfter || (asked && scenario.value(QStringLiteral("result")) == QLatin1String("no"))) {
+        const int shown = engine.interaction.records.size();
         QCOMPARE(engine.config->checkPamUserdb("vic", true, nullptr), skipAfter);
-        QCOMPARE(engine.interaction.records.size(), asked);
+        QCOMPARE(engine.interaction.records.size(), shown);
     }
 }
 

@@ -7,9 +7,12 @@
 #include "policy/FtpServerConfig.h"
 #include "policy/Interaction.h"
 
+#include <QApplication>
 #include <QBrush>
 #include <QColor>
+#include <QElapsedTimer>
 #include <QPalette>
+#include <QScopedValueRollback>
 
 struct TreeModel::Item
 {
@@ -61,6 +64,8 @@ TreeModel::TreeModel(const QStringList &titles, Interaction &interaction, QObjec
     , m_deniedIcon(QStringLiteral(":/prefix/icons/user_red.png"))
 {
     m_titles = titles;
+    m_evaluator.setInterval(0);
+    connect(&m_evaluator, &QTimer::timeout, this, &TreeModel::evaluateSome);
     m_config->load();
     buildRows();
 }
@@ -85,6 +90,39 @@ void TreeModel::buildRows()
     // rather than from inside a paint when the first virtual row is shown.
     if (!virtualNames.isEmpty())
         compute(*m_virtualUsers->children.front());
+    evaluateLater();
+}
+
+void TreeModel::evaluateLater()
+{
+    m_pendingGroup = 0;
+    m_pendingRow = 0;
+    m_evaluator.start();
+}
+
+void TreeModel::evaluateSome()
+{
+    // A few milliseconds at a time, so that the window stays responsive
+    // while every verdict is made ready for the filters that need them all.
+    // Never in the middle of an edit, whose questions run event loops of
+    // their own while the engine is half-way through a repair.
+    if (m_editing || QApplication::activeModalWidget())
+        return;
+    QElapsedTimer slice;
+    slice.start();
+    const Item *groups[] = {m_localUsers, m_virtualUsers};
+    while (m_pendingGroup < 2) {
+        const auto &children = groups[m_pendingGroup]->children;
+        if (m_pendingRow >= children.size()) {
+            ++m_pendingGroup;
+            m_pendingRow = 0;
+            continue;
+        }
+        compute(*children[m_pendingRow++]);
+        if ((m_pendingRow & 63) == 0 && slice.elapsed() >= 8)
+            return;
+    }
+    m_evaluator.stop();
 }
 
 TreeModel::Item *TreeModel::itemOf(const QModelIndex &index) const
@@ -228,6 +266,7 @@ bool TreeModel::setData(const QModelIndex &index, const QVariant &value, int rol
     if (item.kind == Item::Kind::Group)
         return false;
     compute(item);
+    const QScopedValueRollback<bool> editing(m_editing, true);
     bool changed = false;
     switch (index.column()) {
     case UsersColumn:
@@ -403,6 +442,7 @@ void TreeModel::markChanged()
 void TreeModel::refreshAllUsers()
 {
     m_forecast.reset();
+    evaluateLater();
     const int last = columnCount() - 1;
     for (Item *group : {m_localUsers, m_virtualUsers, m_localUsers->parent}) {
         for (const auto &child : group->children)

@@ -7,6 +7,7 @@
 #include <QByteArray>
 #include <QIcon>
 #include <QStringList>
+#include <QTimer>
 
 #include <memory>
 #include <optional>
@@ -95,6 +96,9 @@ private:
     const UserForecast &forecastOf(Item &item) const;
     LoginForecast &loginForecastMutable();
     void refreshAllUsers();
+    // Makes every user's verdict ready in idle time, a slice at a time.
+    void evaluateLater();
+    void evaluateSome();
     void markChanged();
     void invalidData(const QString &reason);
     bool setStatus(Item &item, bool allowed);
@@ -110,6 +114,10 @@ private:
     Item *m_virtualUsers = nullptr;
     mutable std::unique_ptr<LoginForecast> m_forecast;
     bool m_unsaved = false;
+    QTimer m_evaluator;
+    bool m_editing = false;
+    size_t m_pendingGroup = 0;
+    size_t m_pendingRow = 0;
     QIcon m_groupIcon;
     QIcon m_allowedIcon;
     QIcon m_deniedIcon;
