@@ -5,6 +5,11 @@
 //   editchild --root DIR deny USER
 //   editchild --root DIR rights USER "write, download"
 //   editchild --root DIR directory USER /srv/dir
+//   editchild --root DIR vadd USER PASSWORD
+//   editchild --root DIR vchange USER NEWNAME PASSWORD
+//   editchild --root DIR vdelete USER
+// The virtual user edits take the path of the window's dialogs: the account
+// store changes in memory and the save writes the database.
 #include "policy/FtpServerConfig.h"
 
 #include <QCoreApplication>
@@ -56,7 +61,8 @@ int main(int argc, char **argv)
     QStandardPaths::setTestModeEnabled(true);
     const QStringList args = QCoreApplication::arguments();
     if (args.size() < 5 || args[1] != QLatin1String("--root")) {
-        std::fputs("usage: editchild --root DIR grant|deny|rights|directory USER [VALUE]\n", stderr);
+        std::fputs("usage: editchild --root DIR grant|deny|rights|directory|vadd|vchange|vdelete USER [VALUE...]\n",
+                   stderr);
         return 2;
     }
     const QString operation = args[3];
@@ -79,6 +85,15 @@ int main(int argc, char **argv)
             done = config.setUserRights(user, value);
         } else if (operation == QLatin1String("directory")) {
             config.setUserRoot(user, value.toUtf8());
+        } else if (operation == QLatin1String("vadd")) {
+            config.accounts().addVirtualUser(user, value.toUtf8());
+            done = config.isVirtualUser(user);
+        } else if (operation == QLatin1String("vchange")) {
+            config.accounts().changeVirtualUser(user, value.toUtf8(), args.value(6).toUtf8());
+            done = config.isVirtualUser(value.toUtf8());
+        } else if (operation == QLatin1String("vdelete")) {
+            done = config.isVirtualUser(user);
+            config.accounts().removeVirtualUser(user);
         } else {
             std::fputs("unknown operation\n", stderr);
             return 2;

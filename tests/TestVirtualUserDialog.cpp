@@ -155,7 +155,7 @@ void TestVirtualUserDialog::validation_data()
                                {"eve\tsmith", "the name contains a control character"},
                                {QStringLiteral("eve\u0085"), "the name contains a control character"}};
     for (const QStringList &row : bad) {
-        QTest::newRow(qPrintable(QStringLiteral("refused: ") + row.at(1)))
+        QTest::addRow("refused %d: %s", int(&row - bad), qPrintable(row.at(1)))
             << QStringList{row.at(0), "p", "p"} << unusable(row.at(0), qPrintable(row.at(1)))
             << QStringList{row.at(0), "p", "p"};
     }

@@ -47,7 +47,7 @@ NO_LOGIN = "no-login"
 UPLOAD_NAME = "e2e-upload.txt"
 UPLOAD_DATA = b"uploaded through the saved rights\n"
 
-EDITS = ("grant", "deny", "rights", "directory")
+EDITS = ("grant", "deny", "rights", "directory", "vadd", "vchange", "vdelete")
 CHANGES = {harness.CONTENT, harness.MODE, harness.CREATED, harness.REMOVED}
 
 
