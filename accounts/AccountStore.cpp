@@ -259,7 +259,10 @@ void AccountStore::changeVirtualUser(const QByteArray &oldName, const QByteArray
     if (newName == oldName)
         return;
     record.state = VirtualUserState::Modified;
-    record.previousName = oldName;
+    // The key to delete is the one on disk: a second rename before the
+    // save must not leave the first name able to log in.
+    if (record.previousName.isEmpty())
+        record.previousName = oldName;
     const VirtualUserRecord moved = record;
     m_virtualUsers.erase(it);
     m_virtualUsers[newName] = moved;
@@ -276,23 +279,28 @@ void AccountStore::syncVirtualUsers()
 {
     if (!m_db)
         m_db = std::make_unique<VirtualUserDb>(m_databasePath, m_root, m_access);
+    // Every delete before any put, in one transaction: a name renamed away
+    // and added again is written last, and a rename is never half done.
+    QList<QByteArray> deletes;
+    QList<std::pair<QByteArray, QByteArray>> puts;
     for (const auto &[name, record] : m_virtualUsers) {
         switch (record.state) {
         case VirtualUserState::Modified:
             if (!record.previousName.isEmpty()) // a password change keeps the key
-                m_db->del(record.previousName);
-            m_db->put(name, record.password);
+                deletes.append(record.previousName);
+            puts.append({name, record.password});
             break;
         case VirtualUserState::Added:
-            m_db->put(name, record.password);
+            puts.append({name, record.password});
             break;
         case VirtualUserState::Deleted:
-            m_db->del(name);
+            deletes.append(name);
             break;
         case VirtualUserState::Unchanged:
             break;
         }
     }
+    m_db->apply(deletes, puts);
     // Closing flushes the pages to the file that pam_userdb reads.
     m_db->close();
     m_db->open();

@@ -243,6 +243,23 @@ void VirtualUserDb::del(const QByteArray &name)
     });
 }
 
+void VirtualUserDb::apply(const QList<QByteArray> &deletes, const QList<std::pair<QByteArray, QByteArray>> &puts)
+{
+    if (deletes.isEmpty() && puts.isEmpty())
+        return;
+    inTransaction([&](DbTxn *txn) {
+        for (const QByteArray &name : deletes) {
+            Dbt key = bytes(name);
+            m_db->del(txn, &key, 0);
+        }
+        for (const auto &[name, password] : puts) {
+            Dbt key = bytes(name);
+            Dbt data = bytes(password);
+            m_db->put(txn, &key, &data, 0);
+        }
+    });
+}
+
 void VirtualUserDb::recreate(const QByteArray &configuredPath)
 {
     std::cerr << "Closing db..." << std::endl;

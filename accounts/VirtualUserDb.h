@@ -3,6 +3,7 @@
 #include "common/RootDirectory.h"
 
 #include <QByteArray>
+#include <QList>
 
 #include <cstdint>
 #include <functional>
@@ -61,6 +62,8 @@ public:
     // Each in a transaction of its own. Throw DbException.
     void put(const QByteArray &name, const QByteArray &password);
     void del(const QByteArray &name);
+    // The deletes, then the puts, all in one transaction. Throws DbException.
+    void apply(const QList<QByteArray> &deletes, const QList<std::pair<QByteArray, QByteArray>> &puts);
 
     // Drops the database file (after copying it beside itself) and the
     // environment's logs and regions, then opens afresh.

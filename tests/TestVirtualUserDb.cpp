@@ -85,39 +85,57 @@ void TestVirtualUserDb::editStates_data()
 {
     QTest::addColumn<QByteArray>("operations"); // separated by ";"
     QTest::addColumn<QByteArray>("result");
+    QTest::addColumn<QString>("saved"); // the database after a save
 
     // The database starts with anna=a1 and ben=b1.
-    QTest::newRow("loaded") << QByteArray() << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
+    QTest::newRow("loaded") << QByteArray() << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
+                            << QStringLiteral("anna=a1 ben=b1");
     QTest::newRow("add") << QByteArray("add carl c1")
-                         << QByteArray("anna=a1//Unchanged ben=b1//Unchanged carl=c1//Added");
+                         << QByteArray("anna=a1//Unchanged ben=b1//Unchanged carl=c1//Added")
+                         << QStringLiteral("anna=a1 ben=b1 carl=c1");
     QTest::newRow("add existing changes nothing")
-        << QByteArray("add anna other") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
+        << QByteArray("add anna other") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
+        << QStringLiteral("anna=a1 ben=b1");
     QTest::newRow("remove keeps the entry")
-        << QByteArray("remove ben") << QByteArray("anna=a1//Unchanged ben=b1//Deleted");
+        << QByteArray("remove ben") << QByteArray("anna=a1//Unchanged ben=b1//Deleted") << QStringLiteral("anna=a1");
     QTest::newRow("remove then add") << QByteArray("remove ben;add ben b2")
-                                     << QByteArray("anna=a1//Unchanged ben=b2//Added");
+                                     << QByteArray("anna=a1//Unchanged ben=b2//Added")
+                                     << QStringLiteral("anna=a1 ben=b2");
     QTest::newRow("password change") << QByteArray("change anna anna a2")
-                                     << QByteArray("anna=a2//Modified ben=b1//Unchanged");
+                                     << QByteArray("anna=a2//Modified ben=b1//Unchanged")
+                                     << QStringLiteral("anna=a2 ben=b1");
     QTest::newRow("same password changes nothing")
-        << QByteArray("change anna anna a1") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
+        << QByteArray("change anna anna a1") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
+        << QStringLiteral("anna=a1 ben=b1");
     QTest::newRow("empty password never clears")
-        << QByteArray("change anna anna -") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
-    QTest::newRow("rename") << QByteArray("change anna anne -")
-                            << QByteArray("anne=a1/anna/Modified ben=b1//Unchanged");
-    QTest::newRow("rename twice keeps the middle name") << QByteArray("change anna anne -;change anne annie -")
-                                                        << QByteArray("annie=a1/anne/Modified ben=b1//Unchanged");
+        << QByteArray("change anna anna -") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
+        << QStringLiteral("anna=a1 ben=b1");
+    QTest::newRow("rename") << QByteArray("change anna anne -") << QByteArray("anne=a1/anna/Modified ben=b1//Unchanged")
+                            << QStringLiteral("anne=a1 ben=b1");
+    // The record goes under its first name, which is the one on disk.
+    QTest::newRow("rename twice deletes the first name")
+        << QByteArray("change anna anne -;change anne annie -")
+        << QByteArray("annie=a1/anna/Modified ben=b1//Unchanged") << QStringLiteral("annie=a1 ben=b1");
+    // Deletes go before puts: the new ben is not deleted by the rename.
+    QTest::newRow("rename away, then add the name again")
+        << QByteArray("change ben bert -;add ben b2")
+        << QByteArray("anna=a1//Unchanged ben=b2//Added bert=b1/ben/Modified")
+        << QStringLiteral("anna=a1 ben=b2 bert=b1");
     QTest::newRow("rename onto an existing user")
-        << QByteArray("change anna ben x9") << QByteArray("ben=x9/anna/Modified");
+        << QByteArray("change anna ben x9") << QByteArray("ben=x9/anna/Modified") << QStringLiteral("ben=x9");
     QTest::newRow("rename an added user") << QByteArray("add carl c1;change carl karl -")
-                                          << QByteArray("anna=a1//Unchanged ben=b1//Unchanged karl=c1/carl/Modified");
+                                          << QByteArray("anna=a1//Unchanged ben=b1//Unchanged karl=c1/carl/Modified")
+                                          << QStringLiteral("anna=a1 ben=b1 karl=c1");
     QTest::newRow("change an absent user")
-        << QByteArray("change zed zoe z") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged");
+        << QByteArray("change zed zoe z") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
+        << QStringLiteral("anna=a1 ben=b1");
 }
 
 void TestVirtualUserDb::editStates()
 {
     QFETCH(QByteArray, operations);
     QFETCH(QByteArray, result);
+    QFETCH(QString, saved);
 
     FixtureRoot root;
     QVERIFY(root.write());
@@ -139,6 +157,8 @@ void TestVirtualUserDb::editStates()
     QCOMPARE(describe(store.virtualUsers()).toUtf8(), result);
     for (const auto &[name, record] : store.virtualUsers())
         QVERIFY(store.isVirtualUser(name));
+    store.syncVirtualUsers();
+    QCOMPARE(dumped(root.filePath(DbFile)), saved);
 }
 
 void TestVirtualUserDb::saveAndReload()
