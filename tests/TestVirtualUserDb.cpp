@@ -1,6 +1,7 @@
 #include "CaptureStream.h"
 #include "FixtureRoot.h"
 #include "Process.h"
+#include "Scenario.h"
 #include "TestMain.h"
 #include "accounts/AccountStore.h"
 
@@ -83,67 +84,19 @@ private slots:
 
 void TestVirtualUserDb::editStates_data()
 {
-    QTest::addColumn<QByteArray>("operations"); // separated by ";"
-    QTest::addColumn<QByteArray>("result");
-    QTest::addColumn<QString>("saved"); // the database after a save
-
-    // The database starts with anna=a1 and ben=b1.
-    QTest::newRow("loaded") << QByteArray() << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
-                            << QStringLiteral("anna=a1 ben=b1");
-    QTest::newRow("add") << QByteArray("add carl c1")
-                         << QByteArray("anna=a1//Unchanged ben=b1//Unchanged carl=c1//Added")
-                         << QStringLiteral("anna=a1 ben=b1 carl=c1");
-    QTest::newRow("add existing changes nothing")
-        << QByteArray("add anna other") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
-        << QStringLiteral("anna=a1 ben=b1");
-    QTest::newRow("remove keeps the entry")
-        << QByteArray("remove ben") << QByteArray("anna=a1//Unchanged ben=b1//Deleted") << QStringLiteral("anna=a1");
-    QTest::newRow("remove then add") << QByteArray("remove ben;add ben b2")
-                                     << QByteArray("anna=a1//Unchanged ben=b2//Added")
-                                     << QStringLiteral("anna=a1 ben=b2");
-    QTest::newRow("password change") << QByteArray("change anna anna a2")
-                                     << QByteArray("anna=a2//Modified ben=b1//Unchanged")
-                                     << QStringLiteral("anna=a2 ben=b1");
-    QTest::newRow("same password changes nothing")
-        << QByteArray("change anna anna a1") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
-        << QStringLiteral("anna=a1 ben=b1");
-    QTest::newRow("empty password never clears")
-        << QByteArray("change anna anna -") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
-        << QStringLiteral("anna=a1 ben=b1");
-    QTest::newRow("rename") << QByteArray("change anna anne -") << QByteArray("anne=a1/anna/Modified ben=b1//Unchanged")
-                            << QStringLiteral("anne=a1 ben=b1");
-    // The record goes under its first name, which is the one on disk.
-    QTest::newRow("rename twice deletes the first name")
-        << QByteArray("change anna anne -;change anne annie -")
-        << QByteArray("annie=a1/anna/Modified ben=b1//Unchanged") << QStringLiteral("annie=a1 ben=b1");
-    // Deletes go before puts: the new ben is not deleted by the rename.
-    QTest::newRow("rename away, then add the name again")
-        << QByteArray("change ben bert -;add ben b2")
-        << QByteArray("anna=a1//Unchanged ben=b2//Added bert=b1/ben/Modified")
-        << QStringLiteral("anna=a1 ben=b2 bert=b1");
-    QTest::newRow("rename onto an existing user")
-        << QByteArray("change anna ben x9") << QByteArray("ben=x9/anna/Modified") << QStringLiteral("ben=x9");
-    QTest::newRow("rename an added user") << QByteArray("add carl c1;change carl karl -")
-                                          << QByteArray("anna=a1//Unchanged ben=b1//Unchanged karl=c1/carl/Modified")
-                                          << QStringLiteral("anna=a1 ben=b1 karl=c1");
-    QTest::newRow("change an absent user")
-        << QByteArray("change zed zoe z") << QByteArray("anna=a1//Unchanged ben=b1//Unchanged")
-        << QStringLiteral("anna=a1 ben=b1");
+    addScenarioRows(QStringLiteral("virtual-users.txt"));
 }
 
 void TestVirtualUserDb::editStates()
 {
-    QFETCH(QByteArray, operations);
-    QFETCH(QByteArray, result);
-    QFETCH(QString, saved);
-
+    QFETCH(Scenario, scenario);
     FixtureRoot root;
     QVERIFY(root.write());
     QVERIFY(root.writeVirtualUsers(DbFile, {{"anna", "a1"}, {"ben", "b1"}}));
 
     AccountStore store(DbPath, RootDirectory(root.path()));
-    for (const QByteArray &operation : operations.split(';')) {
-        const QList<QByteArray> w = operation.split(' ');
+    for (const QString &operation : scenario.values(QStringLiteral("do"))) {
+        const QList<QByteArray> w = operation.toUtf8().split(' ');
         const auto bytes = [&](int i) { return w.at(i) == "-" ? QByteArray() : w.at(i); };
         if (w[0] == "add")
             store.addVirtualUser(bytes(1), bytes(2));
@@ -152,13 +105,13 @@ void TestVirtualUserDb::editStates()
         else if (w[0] == "change")
             store.changeVirtualUser(bytes(1), bytes(2), bytes(3));
         else
-            QVERIFY(operation.isEmpty());
+            QFAIL("unknown operation");
     }
-    QCOMPARE(describe(store.virtualUsers()).toUtf8(), result);
+    QCOMPARE(describe(store.virtualUsers()), scenario.value(QStringLiteral("users")));
     for (const auto &[name, record] : store.virtualUsers())
         QVERIFY(store.isVirtualUser(name));
     store.syncVirtualUsers();
-    QCOMPARE(dumped(root.filePath(DbFile)), saved);
+    QCOMPARE(dumped(root.filePath(DbFile)), scenario.value(QStringLiteral("saved")));
 }
 
 void TestVirtualUserDb::saveAndReload()

@@ -1,27 +1,7 @@
-"""The run of a table of logins, shared by verdicts.py and forecast.py.
-
-For every scenario: write the files, start vsftpd, log every user in with
-the right password (an admitted user also with a wrong one, which must be
-refused, or the server proves nothing), stop the server, and ask
-ftpconfig-report (JSON and text table) what it thinks of the same files.
-
-A user of a table says:
-  server    "allowed", or "denied: PIECE", a piece of the server's refusal;
-  report    the verdict, "allowed" or "denied: PIECE" of the engine's reason
-            (a piece it gives an admitted user: "allowed: PIECE"); where it
-            differs from the server, `reason` names the documented rule
-            (docs/verdicts.md); no `report`: the verdict is not checked;
-  forecast  must be what the server did, unless "unknown: WHY" (a PAM
-            module the forecast does not model decides) or "bug: ID" (a
-            known fault, printed as FORECAST-BUG: it must still happen);
-  any_password  an empty password that nullok lets through: a wrong
-            password passes too.
-A scenario may say: fails, "start" (the server exits at once) or "connect"
-(every connection ends in "500 OOPS"); blame, the line of vsftpd.conf the
-server stops at, which the findings must name; server_bug, a known fault of
-"server.fails"; report_refuses, a piece of what the program says when it
-ends at start, before any forecast (then only the server is checked).
-"""
+"""The run of a table of logins, shared by verdicts.py and forecast.py: for
+every scenario, write the files, start vsftpd, log every user in, stop the
+server, and ask ftpconfig-report (JSON and text table) about the same files.
+What a table may say is written at the head of verdicts.toml."""
 
 import json
 import os

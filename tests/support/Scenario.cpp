@@ -90,7 +90,12 @@ QList<Scenario> readScenarios(const QString &table, QString *error)
         const QString key = match.captured(1);
         const QString value = match.captured(2);
         if (key.startsWith(QLatin1Char('/'))) {
-            row.files.insert(key, value == QLatin1String("-") ? QByteArray() : unescaped(value).toUtf8());
+            const QByteArray content = unescaped(value).toUtf8();
+            // An empty file is not one left out: a null array is.
+            row.files.insert(key,
+                             value == QLatin1String("-") ? QByteArray()
+                                 : content.isNull()      ? QByteArray("")
+                                                         : content);
         } else {
             row.fields[key] << unescaped(value);
         }
