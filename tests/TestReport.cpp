@@ -1,5 +1,6 @@
 #include "FixtureRoot.h"
 #include "Process.h"
+#include "Scenario.h"
 #include "TestMain.h"
 
 #include <QCryptographicHash>
@@ -51,9 +52,9 @@ QStringList snapshot(const QString &root)
     return entries;
 }
 
-QJsonObject userOf(const QJsonDocument &document, const QString &name)
+QJsonObject userOf(const QJsonObject &document, const QString &name)
 {
-    const QJsonArray users = document.object().value(QStringLiteral("users")).toArray();
+    const QJsonArray users = document.value(QStringLiteral("users")).toArray();
     for (const QJsonValue &user : users) {
         if (user.toObject().value(QStringLiteral("name")).toString() == name)
             return user.toObject();
@@ -68,59 +69,51 @@ class TestReport : public QObject
     Q_OBJECT
 
 private slots:
-    void badRoots_data();
-    void badRoots();
+    void runs_data();
+    void runs();
     void table();
-    void json_data();
-    void json();
-    void createsNothing();
     void hostileFiles_data();
     void hostileFiles();
 };
 
-void TestReport::badRoots_data()
+void TestReport::runs_data()
 {
-    QTest::addColumn<QByteArray>("kind");
-    QTest::addColumn<int>("status");
-    QTest::addColumn<QByteArray>("error"); // "%1": the root
-
-    QTest::newRow("missing root") << QByteArray("missing") << 2 << QByteArray("cannot read root %1: no such directory");
-    QTest::newRow("root is a file") << QByteArray("file") << 2 << QByteArray("cannot read root %1: not a directory");
-    QTest::newRow("unknown option") << QByteArray("option") << 2 << QByteArray("unknown argument: --frobnicate");
-    QTest::newRow("no PAM file") << QByteArray("nopam") << 255
-                                 << QByteArray("Initialization error: Unable to find /etc/pam.d/vsftpd");
-    QTest::newRow("main configuration is a directory")
-        << QByteArray("maindir") << 255 << QByteArray("Initialization error: Unable to open /etc/vsftpd.conf");
+    addScenarioRows(QStringLiteral("report.txt"));
 }
 
-void TestReport::badRoots()
+void TestReport::runs()
 {
-    QFETCH(QByteArray, kind);
-    QFETCH(int, status);
-    QFETCH(QByteArray, error);
-
+    QFETCH(Scenario, scenario);
     FixtureRoot root;
-    QString rootPath = root.path();
-    QStringList arguments;
-    if (kind == "missing") {
-        rootPath = root.filePath(QStringLiteral("/does/not/exist"));
-    } else if (kind == "file") {
-        QVERIFY(root.writeFile(QStringLiteral("/plain"), "x"));
-        rootPath = root.filePath(QStringLiteral("/plain"));
-    } else if (kind == "option") {
-        arguments << QStringLiteral("--frobnicate");
-    } else if (kind == "nopam") {
-        QVERIFY(root.write({{QStringLiteral("/etc/pam.d/vsftpd"), QByteArray()}}));
-    } else {
-        QVERIFY(root.write({{QStringLiteral("/etc/vsftpd.conf"), QByteArray()}}));
-        QVERIFY(root.makeDirectory(QStringLiteral("/etc/vsftpd.conf")));
-    }
-    const ProcessResult result = report(arguments << QStringLiteral("--root") << rootPath);
+    QVERIFY(root.write(scenario.files));
+    QVERIFY(root.writeVirtualUsers(QStringLiteral("/etc/vsftpd/virtual.db"), {{"vic", "secret"}}));
+    const QString rootPath
+        = scenario.has(QStringLiteral("root")) ? root.filePath(scenario.value(QStringLiteral("root"))) : root.path();
+    const QStringList before = snapshot(root.path());
+    const ProcessResult result
+        = report(scenario.value(QStringLiteral("args")).split(QLatin1Char(' '), Qt::SkipEmptyParts)
+                 << QStringLiteral("--root") << rootPath);
     QVERIFY(result.finished);
-    QCOMPARE(result.exitCode, status);
-    QCOMPARE(result.out, QByteArray());
-    const QByteArray line = "ftpconfig-report: " + error.replace("%1", rootPath.toUtf8()) + '\n';
-    QVERIFY2(result.err.endsWith(line), result.err.constData());
+    QCOMPARE(result.exitCode, scenario.value(QStringLiteral("status"), QStringLiteral("0")).toInt());
+    const QString err = QString::fromUtf8(result.err);
+    if (scenario.has(QStringLiteral("error"))) {
+        QCOMPARE(result.out, QByteArray());
+        const QString line = scenario.value(QStringLiteral("error")).replace(QLatin1String("{root}"), rootPath);
+        QVERIFY2(err.endsWith(QStringLiteral("ftpconfig-report: %1\n").arg(line)), qPrintable(err));
+    }
+    for (const QString &line : scenario.values(QStringLiteral("says")))
+        QVERIFY2(err.contains(line), qPrintable(err));
+    if (scenario.has(QStringLiteral("creates-nothing")))
+        QCOMPARE(snapshot(root.path()), before);
+    const QJsonObject document = QJsonDocument::fromJson(result.out).object();
+    for (const QString &expected : scenario.values(QStringLiteral("user"))) {
+        QCOMPARE(document.value(QLatin1String("root")).toString(), root.path());
+        const QJsonObject row = userOf(document, expected.section(QLatin1Char('|'), 0, 0));
+        QStringList fields;
+        for (const char *key : {"name", "kind", "status", "failureKind", "message"})
+            fields << row.value(QLatin1String(key)).toVariant().toString();
+        QCOMPARE(fields.join(QLatin1Char('|')), expected);
+    }
 }
 
 void TestReport::table()
@@ -169,77 +162,6 @@ void TestReport::table()
     }
     // One line per account, the anonymous row, the header and the final newline.
     QCOMPARE(lines.size(), 8 + 1 + 1 + 1);
-}
-
-void TestReport::json_data()
-{
-    QTest::addColumn<FileMap>("files");
-    QTest::addColumn<QString>("user");
-    QTest::addColumn<QString>("expected"); // kind|status|failureKind|message
-
-    const QByteArray userdb = "auth sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
-                              "account sufficient pam_userdb.so db=/etc/vsftpd/virtual\n";
-    const FileMap guests{{QStringLiteral("/etc/vsftpd.conf"), "local_enable=YES\nguest_enable=YES\n"},
-                         {QStringLiteral("/etc/pam.d/vsftpd"), userdb}};
-    QTest::newRow("local") << FileMap() << QStringLiteral("locked")
-                           << QStringLiteral("local|denied|5|***Result: FALSE. Check: user locked  has bad passwd in "
-                                             "/etc/shadow (* or !).");
-    QTest::newRow("anonymous") << FileMap{{QStringLiteral("/etc/vsftpd.conf"),
-                                           "anonymous_enable=NO\nlocal_enable=YES\n"}}
-                               << QStringLiteral("Anonymous users")
-                               << QStringLiteral("anonymous|denied|3|***Result: FALSE. Check: main ftp config has "
-                                                 "anonymous_enable option != yes.");
-    QTest::newRow("virtual") << guests << QStringLiteral("vic") << QStringLiteral("virtual|allowed|0|");
-    FileMap behind = guests;
-    behind[QStringLiteral("/etc/pam.d/vsftpd")].prepend("auth required pam_unix.so\n");
-    QTest::newRow("virtual behind another module")
-        << behind << QStringLiteral("vic")
-        << QStringLiteral("virtual|denied|0|PAM configuration problem: the first auth or account line of the PAM "
-                          "file is not \"sufficient pam_userdb.so\"");
-}
-
-void TestReport::json()
-{
-    QFETCH(FileMap, files);
-    QFETCH(QString, user);
-    QFETCH(QString, expected);
-
-    FixtureRoot root;
-    QVERIFY(root.write(files));
-    QVERIFY(root.writeVirtualUsers(QStringLiteral("/etc/vsftpd/virtual.db"), {{"vic", "secret"}}));
-    const ProcessResult result = report({QStringLiteral("--json"), QStringLiteral("--root"), root.path()});
-    QCOMPARE(result.exitCode, 0);
-    QJsonParseError error{};
-    const QJsonDocument document = QJsonDocument::fromJson(result.out, &error);
-    QCOMPARE(error.error, QJsonParseError::NoError);
-    QCOMPARE(document.object().value(QLatin1String("root")).toString(), root.path());
-    const QJsonObject row = userOf(document, user);
-    const auto field = [&](const char *key) { return row.value(QLatin1String(key)).toVariant().toString(); };
-    QCOMPARE(
-        QStringList({field("kind"), field("status"), field("failureKind"), field("message")}).join(QLatin1Char('|')),
-        expected);
-}
-
-void TestReport::createsNothing()
-{
-    // A fresh machine: no main configuration, no per-user directory, a PAM
-    // file naming a database that does not exist, no state directory.
-    FixtureRoot root;
-    QVERIFY(root.write(
-        {{QStringLiteral("/etc/vsftpd.conf"), QByteArray()},
-         {QStringLiteral("/etc/pam.d/vsftpd"), "auth sufficient pam_userdb.so db=/var/lib/ftpconfig/users\n"}}));
-    const QStringList before = snapshot(root.path());
-    const ProcessResult result = report({QStringLiteral("--json"), QStringLiteral("--root"), root.path()});
-    QCOMPARE(result.exitCode, 0);
-    QCOMPARE(snapshot(root.path()), before);
-    QVERIFY(result.err.contains("/etc/vsftpd.conf not found"));
-    // Read as "listen=YES" alone: local users are refused for want of
-    // local_enable, anonymous users admitted.
-    const QJsonDocument document = QJsonDocument::fromJson(result.out);
-    QCOMPARE(userOf(document, QStringLiteral("bob")).value(QLatin1String("message")).toString(),
-             QStringLiteral("***Result: FALSE. Check: main ftp config has no local_enable defined"));
-    QCOMPARE(userOf(document, QStringLiteral("Anonymous users")).value(QLatin1String("status")).toString(),
-             QStringLiteral("allowed"));
 }
 
 void TestReport::hostileFiles_data()
