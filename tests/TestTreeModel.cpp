@@ -50,6 +50,9 @@ struct Table
     bool reload()
     {
         tester.reset();
+        // One database environment at a time: a second one opened over the
+        // same home runs recovery under the first one's feet.
+        model.reset();
         qputenv("FTPCONFIG_ROOT", QFile::encodeName(root.path()));
         CaptureStream out(std::cout);
         model = std::make_unique<TreeModel>(QStringList{"users", "status", "directory", "mode", "server"}, interaction);

@@ -9,6 +9,9 @@ namespace testsupport {
 // Runs the test object like QTest::qExec, except that every Qt warning
 // fails the test function it happens in (or, outside one, the run).
 int runTests(QObject *testObject, int argc, char **argv);
+// In a forked child that is about to end the process: no leak check at its
+// exit under LeakSanitizer.
+void forgetLeaksAtExit();
 } // namespace testsupport
 
 #define FTPCONFIG_TEST_MAIN(TestObject)                        \
