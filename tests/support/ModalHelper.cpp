@@ -180,6 +180,10 @@ void ModalHelper::poll()
     QWidget *widget = QApplication::activeModalWidget();
     if (!widget)
         return;
+    // A widget answered before is active again when a dialog its action
+    // opened has closed: the action is still running and closes it.
+    if (widget != m_current && m_answered.contains(widget))
+        return;
     if (widget == m_current) {
         if (m_currentSince.elapsed() > m_timeout) {
             fail(QStringLiteral("still open after %1 ms: %2").arg(m_timeout).arg(summary(describe(widget))));
@@ -189,6 +193,7 @@ void ModalHelper::poll()
     }
 
     m_current = widget;
+    m_answered.append(widget);
     m_currentSince.start();
     // Once hidden it is done with; shown again, it is answered again.
     widget->installEventFilter(this);
@@ -219,9 +224,12 @@ void ModalHelper::poll()
 
 bool ModalHelper::eventFilter(QObject *watched, QEvent *event)
 {
-    if (event->type() == QEvent::Hide && watched == m_current) {
+    if (event->type() == QEvent::Hide) {
+        m_answered.removeAll(static_cast<QWidget *>(watched));
+        m_answered.removeAll(nullptr);
         watched->removeEventFilter(this);
-        m_current = nullptr;
+        if (watched == m_current)
+            m_current = nullptr;
     }
     return QObject::eventFilter(watched, event);
 }

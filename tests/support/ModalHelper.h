@@ -89,6 +89,8 @@ private:
     QStringList m_failures;
     QTimer m_timer;
     QPointer<QWidget> m_current;
+    // Answered and still open (their actions may have opened m_current).
+    QList<QPointer<QWidget>> m_answered;
     QElapsedTimer m_currentSince;
     int m_timeout;
     bool m_checked = false;
