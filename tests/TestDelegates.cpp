@@ -1,29 +1,19 @@
 // The cell editors of the users table and the permissions editor, driven
 // through the main window's view on a fixture root.
-#include "FixtureRoot.h"
 #include "ModalHelper.h"
 #include "TestMain.h"
-#include "app/CMainWindow.h"
-#include "app/Server.h"
+#include "WindowFixture.h"
 #include "common/AppStrings.h"
 #include "dialogs/PermissionsEditorDialog.h"
 #include "policy/FtpServerConfig.h"
-#include "usertable/CMainTreeView.h"
-#include "usertable/CUsersFilterProxyModel.h"
 #include "usertable/MyEditor.h"
-#include "usertable/TreeModel.h"
 
-#include <QAbstractItemModelTester>
 #include <QCheckBox>
 #include <QComboBox>
 #include <QDialogButtonBox>
 #include <QGroupBox>
 #include <QLineEdit>
 #include <QPushButton>
-#include <QSettings>
-#include <QTemporaryDir>
-
-#include <memory>
 
 #include <unistd.h>
 
@@ -47,9 +37,18 @@ class TestDelegates : public QObject
     Q_OBJECT
 
 private Q_SLOTS:
-    void initTestCase();
-    void init();
-    void cleanup();
+    void initTestCase()
+    {
+        QVERIFY(m_f.setUp());
+    }
+    void init()
+    {
+        QVERIFY(m_f.open());
+    }
+    void cleanup()
+    {
+        QCOMPARE(m_f.close(), QString());
+    }
     void statusChoiceCommitsAtOnce_data();
     void statusChoiceCommitsAtOnce();
     void missingDirectory_data();
@@ -62,66 +61,16 @@ private Q_SLOTS:
     void modeCellAppliesRightsAndBits();
 
 private:
-    QModelIndex viewIndex(const QString &name, int column) const;
-    QString cell(const QString &name, int column) const;
-    template <typename T> T *openEditor(const QString &name, int column);
+    template <typename T> T *openEditor(const QString &name, int column)
+    {
+        const QModelIndex index = m_f.viewIndex(name, column);
+        m_f.window->view()->setCurrentIndex(index);
+        m_f.window->view()->edit(index);
+        return qobject_cast<T *>(m_f.window->view()->indexWidget(index));
+    }
 
-    QTemporaryDir m_settings;
-    std::unique_ptr<Server> m_server;
-    std::unique_ptr<FixtureRoot> m_root;
-    std::unique_ptr<CMainWindow> m_window;
-    std::unique_ptr<QAbstractItemModelTester> m_tester;
+    WindowFixture m_f;
 };
-
-void TestDelegates::initTestCase()
-{
-    QVERIFY(m_settings.isValid());
-    qputenv("XDG_CONFIG_HOME", QFile::encodeName(m_settings.path()));
-    QApplication::setQuitOnLastWindowClosed(false);
-    m_server = std::make_unique<Server>(QDBusConnection(QStringLiteral("ftpconfig-no-bus")));
-}
-
-void TestDelegates::init()
-{
-    QSettings().clear();
-    m_root = std::make_unique<FixtureRoot>();
-    QVERIFY(m_root->write());
-    qputenv("FTPCONFIG_ROOT", QFile::encodeName(m_root->path()));
-    m_window = std::make_unique<CMainWindow>(*m_server);
-    m_tester = std::make_unique<QAbstractItemModelTester>(m_window->proxy(),
-                                                          QAbstractItemModelTester::FailureReportingMode::QtTest);
-    m_window->show();
-    QVERIFY(QTest::qWaitForWindowExposed(m_window.get()));
-}
-
-void TestDelegates::cleanup()
-{
-    m_tester.reset();
-    m_window.reset();
-    m_root.reset();
-    QCoreApplication::sendPostedEvents(nullptr, QEvent::DeferredDelete);
-    const QWidgetList left = QApplication::topLevelWidgets();
-    QVERIFY2(left.isEmpty(), left.isEmpty() ? "" : left.first()->metaObject()->className());
-}
-
-QModelIndex TestDelegates::viewIndex(const QString &name, int column) const
-{
-    return m_window->proxy()->mapFromSource(m_window->model()->indexOfUser(name, column));
-}
-
-QString TestDelegates::cell(const QString &name, int column) const
-{
-    return viewIndex(name, column).data().toString();
-}
-
-template <typename T> T *TestDelegates::openEditor(const QString &name, int column)
-{
-    CMainTreeView *view = m_window->view();
-    const QModelIndex index = viewIndex(name, column);
-    view->setCurrentIndex(index);
-    view->edit(index);
-    return qobject_cast<T *>(view->indexWidget(index));
-}
 
 void TestDelegates::statusChoiceCommitsAtOnce_data()
 {
@@ -141,18 +90,18 @@ void TestDelegates::statusChoiceCommitsAtOnce()
     QFETCH(QString, before);
     QFETCH(int, openIndex);
     QFETCH(QString, after);
-    if (cell(user, TreeModel::StatusColumn) != before)
-        QVERIFY(m_window->model()->setData(m_window->model()->indexOfUser(user, TreeModel::StatusColumn), before));
-    QCOMPARE(cell(user, TreeModel::StatusColumn), before);
+    if (m_f.cell(user, TreeModel::StatusColumn) != before)
+        QVERIFY(m_f.setStatus(user, before));
+    QCOMPARE(m_f.cell(user, TreeModel::StatusColumn), before);
 
     auto *combo = openEditor<QComboBox>(user, TreeModel::StatusColumn);
     QVERIFY(combo);
     QCOMPARE(combo->currentIndex(), openIndex);
     combo->setCurrentText(after);
     // Still in the cell, and the access changed already.
-    QCOMPARE(m_window->view()->indexWidget(viewIndex(user, TreeModel::StatusColumn)), combo);
-    QCOMPARE(cell(user, TreeModel::StatusColumn), after);
-    QVERIFY(m_window->model()->hasUnsavedChanges());
+    QCOMPARE(m_f.window->view()->indexWidget(m_f.viewIndex(user, TreeModel::StatusColumn)), combo);
+    QCOMPARE(m_f.cell(user, TreeModel::StatusColumn), after);
+    QVERIFY(m_f.window->model()->hasUnsavedChanges());
 }
 
 void TestDelegates::missingDirectory_data()
@@ -167,7 +116,7 @@ void TestDelegates::missingDirectory()
 {
     QFETCH(QString, answer);
     QFETCH(bool, written);
-    const QString before = cell(QStringLiteral("bob"), TreeModel::DirectoryColumn);
+    const QString before = m_f.cell(QStringLiteral("bob"), TreeModel::DirectoryColumn);
     auto *editor = openEditor<MyEditor>(QStringLiteral("bob"), TreeModel::DirectoryColumn);
     QVERIFY(editor);
     QCOMPARE(editor->text(), before);
@@ -180,18 +129,19 @@ void TestDelegates::missingDirectory()
         modal.expect(QString(), QStringLiteral("No"));
     // The view commits and closes the editor from its event loop.
     QTest::keyClick(editor->focusProxy(), Qt::Key_Return);
-    QTRY_VERIFY(!m_window->view()->indexWidget(viewIndex(QStringLiteral("bob"), TreeModel::DirectoryColumn)));
+    QTRY_VERIFY(!m_f.window->view()->indexWidget(m_f.viewIndex(QStringLiteral("bob"), TreeModel::DirectoryColumn)));
     QVERIFY2(modal.done(), qPrintable(modal.report()));
     QCOMPARE(modal.seen().first().informativeText, QStringLiteral("Do you want to create it?"));
     QStringList buttons = modal.seen().first().buttons;
     buttons.sort();
-    QCOMPARE(buttons, (QStringList{"Create", "No"}));
+    QCOMPARE(buttons, (strings("Create", "No")));
 
-    const QFileInfo created(m_root->filePath(QStringLiteral("/srv/bob")));
+    const QFileInfo created(m_f.root->filePath(QStringLiteral("/srv/bob")));
     QCOMPARE(created.isDir(), written);
-    QCOMPARE(cell(QStringLiteral("bob"), TreeModel::DirectoryColumn), written ? QStringLiteral("/srv/bob") : before);
+    QCOMPARE(m_f.cell(QStringLiteral("bob"), TreeModel::DirectoryColumn),
+             written ? QStringLiteral("/srv/bob") : before);
     if (written)
-        QCOMPARE(m_window->model()->config().accounts().userNameById(created.ownerId()), QByteArray("bob"));
+        QCOMPARE(m_f.window->model()->config().accounts().userNameById(created.ownerId()), QByteArray("bob"));
 }
 
 void TestDelegates::rightsRoundTrip_data()
@@ -215,7 +165,7 @@ void TestDelegates::rightsRoundTrip()
     QFETCH(QString, rights);
     QFETCH(bool, uploadEnabled);
     QFETCH(QString, result);
-    FtpServerConfig &config = m_window->model()->config();
+    FtpServerConfig &config = m_f.window->model()->config();
     config.setOption("guest_enable", guest);
     PermissionsEditorDialog dialog(rights, config, user.toLocal8Bit());
     QCOMPARE(child<QCheckBox>(&dialog, "ftp_upload")->isEnabled(), uploadEnabled);
@@ -225,12 +175,12 @@ void TestDelegates::rightsRoundTrip()
 
 void TestDelegates::permissionBits()
 {
-    QVERIFY(::chown(QFile::encodeName(m_root->filePath(QStringLiteral("/srv/ftp"))).constData(), 4242, 4343) == 0);
-    PermissionsEditorDialog dialog(QString(), m_window->model()->config(), anonymous.toLocal8Bit());
+    QVERIFY(::chown(QFile::encodeName(m_f.root->filePath(QStringLiteral("/srv/ftp"))).constData(), 4242, 4343) == 0);
+    PermissionsEditorDialog dialog(QString(), m_f.window->model()->config(), anonymous.toLocal8Bit());
     QVERIFY(child<QGroupBox>(&dialog, "fs_groupbox")->isEnabled());
     QCOMPARE(child<QComboBox>(&dialog, "owner_combo")->currentText(), QStringLiteral("4242"));
     QCOMPARE(child<QComboBox>(&dialog, "group_combo")->currentText(), QStringLiteral("4343"));
-    QCOMPARE(dialog.permissions(), QFileInfo(m_root->filePath(QStringLiteral("/srv/ftp"))).permissions() & classBits);
+    QCOMPARE(dialog.permissions(), QFileInfo(m_f.root->filePath(QStringLiteral("/srv/ftp"))).permissions() & classBits);
 
     QPushButton *ok = child<QDialogButtonBox>(&dialog, "dialogButtonBox")->button(QDialogButtonBox::Ok);
     QVERIFY(!ok->isEnabled());
@@ -254,19 +204,19 @@ void TestDelegates::missingRootInEditor()
 {
     QFETCH(QString, answer);
     QFETCH(bool, created);
-    QDir(m_root->filePath(QStringLiteral("/srv/ftp"))).removeRecursively();
+    QDir(m_f.root->filePath(QStringLiteral("/srv/ftp"))).removeRecursively();
     ModalHelper modal;
     modal.expect(QStringLiteral("Directory /srv/ftp does not exist."), answer);
-    PermissionsEditorDialog dialog(QString(), m_window->model()->config(), anonymous.toLocal8Bit());
+    PermissionsEditorDialog dialog(QString(), m_f.window->model()->config(), anonymous.toLocal8Bit());
     QVERIFY2(modal.done(), qPrintable(modal.report()));
     QCOMPARE(modal.seen().first().informativeText, QStringLiteral("(Do you want to create it?"));
-    QCOMPARE(QFileInfo(m_root->filePath(QStringLiteral("/srv/ftp"))).isDir(), created);
+    QCOMPARE(QFileInfo(m_f.root->filePath(QStringLiteral("/srv/ftp"))).isDir(), created);
     QCOMPARE(child<QGroupBox>(&dialog, "fs_groupbox")->isEnabled(), created);
 }
 
 void TestDelegates::modeCellAppliesRightsAndBits()
 {
-    const QString ftpRoot = m_root->filePath(QStringLiteral("/srv/ftp"));
+    const QString ftpRoot = m_f.root->filePath(QStringLiteral("/srv/ftp"));
     constexpr QFileDevice::Permissions chosen = QFileDevice::ReadOwner | QFileDevice::WriteOwner | QFileDevice::ExeOwner
         | QFileDevice::ReadGroup | QFileDevice::ExeGroup | QFileDevice::ReadOther;
     QVERIFY((QFileInfo(ftpRoot).permissions() & classBits) != chosen);
@@ -283,7 +233,7 @@ void TestDelegates::modeCellAppliesRightsAndBits()
     });
     QVERIFY(!openEditor<QWidget>(anonymous, TreeModel::ModeColumn));
     QVERIFY2(modal.done(), qPrintable(modal.report()));
-    QCOMPARE(cell(anonymous, TreeModel::ModeColumn), QStringLiteral("download"));
+    QCOMPARE(m_f.cell(anonymous, TreeModel::ModeColumn), QStringLiteral("download"));
     QCOMPARE(QFileInfo(ftpRoot).permissions() & classBits, chosen);
 }
 

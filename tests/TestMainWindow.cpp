@@ -1,6 +1,6 @@
-#include "FixtureRoot.h"
 #include "ModalHelper.h"
 #include "TestMain.h"
+#include "WindowFixture.h"
 #include "app/CMainWindow.h"
 #include "app/LoginCheckDock.h"
 #include "app/Server.h"
@@ -22,32 +22,37 @@
 
 namespace {
 
-const QString settingsKeys[] = {QStringLiteral("MW/width"), QStringLiteral("MW/height"), QStringLiteral("MW/toolbars"),
-                                QStringLiteral("MW/toolbar_Orientation"), QStringLiteral("MW/treeHeaderState")};
-
 QStringList storedKeys()
 {
     QStringList keys;
-    for (const QString &key : settingsKeys) {
-        if (QSettings().contains(key))
-            keys << key;
+    for (const char *key : {"MW/width", "MW/height", "MW/toolbars", "MW/toolbar_Orientation", "MW/treeHeaderState"}) {
+        if (QSettings().contains(QLatin1String(key)))
+            keys << QLatin1String(key);
     }
     return keys;
 }
 
 } // namespace
 
-// The main window on a fixture root: local users of FixtureRoot, the
-// virtual users carol and dave, and a service that always fails (a bus
-// that is not connected), so that nothing on this machine is started.
+// The main window on the window fixture (see WindowFixture.h).
 class TestMainWindow : public QObject
 {
     Q_OBJECT
 
 private Q_SLOTS:
-    void initTestCase();
-    void init();
-    void cleanup();
+    void initTestCase()
+    {
+        vexInit("1.2.13", "Program to control FTP server VSFTPD");
+        QVERIFY(m_f.setUp());
+    }
+    void init()
+    {
+        QVERIFY(m_f.open());
+    }
+    void cleanup()
+    {
+        QCOMPARE(m_f.close(), QString());
+    }
     void firstRun();
     void closeWithUnsavedChanges_data();
     void closeWithUnsavedChanges();
@@ -62,89 +67,23 @@ private Q_SLOTS:
     void loginCheckFollowsEdits();
 
 private:
-    QModelIndex sourceIndex(const QString &name, int column = TreeModel::UsersColumn) const;
-    void select(const QString &name);
-    QAction *action(const char *name) const;
-    QString userlist() const;
+    QString userlist() const
+    {
+        return QString::fromUtf8(m_f.root->readFile(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")));
+    }
 
-    QTemporaryDir m_config;
-    std::unique_ptr<Server> m_server;
-    std::unique_ptr<FixtureRoot> m_root;
-    std::unique_ptr<CMainWindow> m_window;
-    std::unique_ptr<QAbstractItemModelTester> m_tester;
+    WindowFixture m_f;
 };
-
-void TestMainWindow::initTestCase()
-{
-    QVERIFY(m_config.isValid());
-    qputenv("XDG_CONFIG_HOME", QFile::encodeName(m_config.path()));
-    vexInit("1.2.13", "Program to control FTP server VSFTPD");
-    QApplication::setQuitOnLastWindowClosed(false);
-    QVERIFY2(QSettings().fileName().startsWith(m_config.path()), qPrintable(QSettings().fileName()));
-    m_server = std::make_unique<Server>(QDBusConnection(QStringLiteral("ftpconfig-no-bus")));
-}
-
-void TestMainWindow::init()
-{
-    QSettings().clear();
-    m_root = std::make_unique<FixtureRoot>();
-    const QByteArray userdb = "auth sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
-                              "account sufficient pam_userdb.so db=/etc/vsftpd/virtual\n";
-    QVERIFY(m_root->write({{"/etc/pam.d/vsftpd", userdb + FixtureRoot::defaults().value("/etc/pam.d/vsftpd")}}));
-    QVERIFY(m_root->writeVirtualUsers(QStringLiteral("/etc/vsftpd/virtual.db"), {{"carol", "c"}, {"dave", "d"}}));
-    qputenv("FTPCONFIG_ROOT", QFile::encodeName(m_root->path()));
-    m_window = std::make_unique<CMainWindow>(*m_server);
-    QVERIFY(m_window->model());
-    m_tester = std::make_unique<QAbstractItemModelTester>(m_window->proxy(),
-                                                          QAbstractItemModelTester::FailureReportingMode::QtTest);
-    m_window->show();
-    QVERIFY(QTest::qWaitForWindowExposed(m_window.get()));
-}
-
-void TestMainWindow::cleanup()
-{
-    m_tester.reset();
-    m_window.reset();
-    m_root.reset();
-    QCoreApplication::sendPostedEvents(nullptr, QEvent::DeferredDelete);
-    const QWidgetList left = QApplication::topLevelWidgets();
-    QVERIFY2(left.isEmpty(), left.isEmpty() ? "" : left.first()->metaObject()->className());
-}
-
-QModelIndex TestMainWindow::sourceIndex(const QString &name, int column) const
-{
-    TreeModel *model = m_window->model();
-    const QModelIndexList found
-        = model->match(model->index(0, 0), Qt::DisplayRole, name, 1, Qt::MatchExactly | Qt::MatchRecursive);
-    return found.isEmpty() ? QModelIndex() : found.first().siblingAtColumn(column);
-}
-
-void TestMainWindow::select(const QString &name)
-{
-    const QModelIndex index = m_window->proxy()->mapFromSource(sourceIndex(name));
-    QVERIFY2(index.isValid(), qPrintable(name));
-    m_window->view()->setCurrentIndex(index);
-}
-
-QAction *TestMainWindow::action(const char *name) const
-{
-    return m_window->findChild<QAction *>(QLatin1String(name));
-}
-
-QString TestMainWindow::userlist() const
-{
-    return QString::fromUtf8(m_root->readFile(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")));
-}
 
 void TestMainWindow::firstRun()
 {
-    QCOMPARE(m_window->size(), QSize(640, 480));
-    QCOMPARE(m_window->findChild<QToolBar *>()->orientation(), Qt::Horizontal);
-    const QHeaderView *header = m_window->view()->header();
+    QCOMPARE(m_f.window->size(), QSize(640, 480));
+    QCOMPARE(m_f.window->findChild<QToolBar *>()->orientation(), Qt::Horizontal);
+    const QHeaderView *header = m_f.window->view()->header();
     // QTreeView hides the hint of QAbstractItemView, which is public.
-    const QAbstractItemView *view = m_window->view();
+    const QAbstractItemView *view = m_f.window->view();
     QCOMPARE(header->count(), 5);
-    QCOMPARE(m_window->model()->headerData(TreeModel::ServerColumn, Qt::Horizontal).toString(),
+    QCOMPARE(m_f.window->model()->headerData(TreeModel::ServerColumn, Qt::Horizontal).toString(),
              QStringLiteral("server"));
     for (int column = 0; column < header->count(); ++column) {
         const int contents = qMax(view->sizeHintForColumn(column), header->sectionSizeHint(column));
@@ -155,17 +94,17 @@ void TestMainWindow::firstRun()
             QVERIFY(header->sectionSize(column) >= contents);
     }
     // Nothing changed yet: no Save, no label; the service is stopped.
-    QVERIFY(!action("actionSave")->isEnabled());
-    QVERIFY(!m_window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
-    QCOMPARE(action("actionStartStopService")->text(), QStringLiteral("Start FTP service"));
+    QVERIFY(!m_f.action("actionSave")->isEnabled());
+    QVERIFY(!m_f.window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
+    QCOMPARE(m_f.action("actionStartStopService")->text(), QStringLiteral("Start FTP service"));
     // Checked from the start, yet system users stay until toggled twice.
-    QAction *hideSystem = action("hideSystemUsersAction");
+    QAction *hideSystem = m_f.action("hideSystemUsersAction");
     QVERIFY(hideSystem->isChecked());
-    QVERIFY(!m_window->proxy()->hideSystemUsers());
+    QVERIFY(!m_f.window->proxy()->hideSystemUsers());
     hideSystem->trigger();
-    QVERIFY(!m_window->proxy()->hideSystemUsers());
+    QVERIFY(!m_f.window->proxy()->hideSystemUsers());
     hideSystem->trigger();
-    QVERIFY(m_window->proxy()->hideSystemUsers());
+    QVERIFY(m_f.window->proxy()->hideSystemUsers());
 }
 
 void TestMainWindow::closeWithUnsavedChanges_data()
@@ -182,17 +121,16 @@ void TestMainWindow::closeWithUnsavedChanges()
     QFETCH(bool, closed);
     // bob denied: the userlist gets him, in memory until saved.
     const QString before = userlist();
-    QVERIFY(m_window->model()->setData(sourceIndex(QStringLiteral("bob"), TreeModel::StatusColumn),
-                                       QStringLiteral("denied")));
-    QVERIFY(action("actionSave")->isEnabled());
-    QVERIFY(m_window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
+    QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
+    QVERIFY(m_f.action("actionSave")->isEnabled());
+    QVERIFY(m_f.window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
 
     ModalHelper modal;
     modal.expect(QStringLiteral("Do you want to save changes?"), answer);
-    QCOMPARE(m_window->close(), closed);
+    QCOMPARE(m_f.window->close(), closed);
     QVERIFY2(modal.done(), qPrintable(modal.report()));
     QCOMPARE(modal.seen().first().icon, QMessageBox::Question);
-    QCOMPARE(m_window->isVisible(), !closed);
+    QCOMPARE(m_f.window->isVisible(), !closed);
     QCOMPARE(storedKeys().size(), closed ? 5 : 0);
     QCOMPARE(userlist(), before);
 }
@@ -212,23 +150,22 @@ void TestMainWindow::startWithUnsavedChanges()
     QFETCH(QString, answer);
     QFETCH(bool, started);
     QFETCH(bool, saved);
-    QVERIFY(m_window->model()->setData(sourceIndex(QStringLiteral("bob"), TreeModel::StatusColumn),
-                                       QStringLiteral("denied")));
+    QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
 
     ModalHelper modal;
     modal.expect(QStringLiteral("You have unsaved changes. Do you want to save them before service start?"), answer);
     // The service fails to start here, which is how a start shows.
     if (started)
         modal.expect(QString(), QStringLiteral("OK"));
-    action("actionStartStopService")->trigger();
+    m_f.action("actionStartStopService")->trigger();
     QVERIFY2(modal.done(), qPrintable(modal.report()));
     QCOMPARE(modal.seen().first().icon, QMessageBox::Warning);
     if (started) {
-        QCOMPARE(modal.seen().last().text, QStringLiteral("Failed to start vsftpd.\n") + m_server->lastError());
+        QCOMPARE(modal.seen().last().text, QStringLiteral("Failed to start vsftpd.\n") + m_f.server->lastError());
         QCOMPARE(modal.seen().last().icon, QMessageBox::NoIcon);
     }
     QCOMPARE(userlist().contains(QLatin1String("bob")), saved);
-    QCOMPARE(action("actionSave")->isEnabled(), !saved);
+    QCOMPARE(m_f.action("actionSave")->isEnabled(), !saved);
 }
 
 void TestMainWindow::filterKeepsCurrentRow_data()
@@ -244,18 +181,18 @@ void TestMainWindow::filterKeepsCurrentRow()
 {
     QFETCH(QString, filter);
     QFETCH(QString, user);
-    select(user);
-    const int before = m_window->proxy()->rowCount(m_window->proxy()->mapFromSource(sourceIndex(user).parent()));
-    QAction *toggle = action(qPrintable(filter));
+    QVERIFY(m_f.select(user));
+    const int before = m_f.window->proxy()->rowCount(m_f.window->proxy()->mapFromSource(m_f.source(user).parent()));
+    QAction *toggle = m_f.action(qPrintable(filter));
     // Hide system users starts checked but unapplied: twice applies it.
     toggle->trigger();
     if (!toggle->isChecked())
         toggle->trigger();
-    const QModelIndex current = m_window->view()->currentIndex();
-    QCOMPARE(m_window->proxy()->mapToSource(current), sourceIndex(user));
-    QVERIFY(m_window->view()->selectionModel()->isSelected(current));
+    const QModelIndex current = m_f.window->view()->currentIndex();
+    QCOMPARE(m_f.window->proxy()->mapToSource(current), m_f.source(user));
+    QVERIFY(m_f.window->view()->selectionModel()->isSelected(current));
     // The filter did hide someone beside the kept row.
-    QVERIFY(m_window->proxy()->rowCount(current.parent()) < before);
+    QVERIFY(m_f.window->proxy()->rowCount(current.parent()) < before);
 }
 
 void TestMainWindow::userActionsFollowSelection_data()
@@ -273,12 +210,13 @@ void TestMainWindow::userActionsFollowSelection()
 {
     QFETCH(QString, row);
     QFETCH(bool, shown);
-    select(QStringLiteral("dave"));
-    select(row);
-    QCOMPARE(action("actionEdit_user")->isVisible(), shown);
-    QCOMPARE(action("actionDelete_user")->isVisible(), shown);
+    QVERIFY(m_f.select(QStringLiteral("dave")));
+    QVERIFY(m_f.select(row));
+    QCOMPARE(m_f.action("actionEdit_user")->isVisible(), shown);
+    QCOMPARE(m_f.action("actionDelete_user")->isVisible(), shown);
     // The login check follows the same selection.
-    QCOMPARE(m_window->loginCheckDock()->userName(), m_window->model()->isUserRow(sourceIndex(row)) ? row : QString());
+    QCOMPARE(m_f.window->loginCheckDock()->userName(),
+             m_f.window->model()->isUserRow(m_f.source(row)) ? row : QString());
 }
 
 void TestMainWindow::deleteVirtualUser_data()
@@ -303,26 +241,23 @@ void TestMainWindow::deleteVirtualUser()
     QFETCH(QString, question);
     QFETCH(QString, answer);
     QFETCH(bool, removed);
-    if (row.isEmpty())
-        m_window->view()->setCurrentIndex(QModelIndex());
-    else
-        select(row);
+    QVERIFY(m_f.select(row));
     ModalHelper modal;
     modal.expect(question, answer);
-    m_window->deleteUser();
+    m_f.window->deleteUser();
     QVERIFY2(modal.done(), qPrintable(modal.report()));
     QCOMPARE(modal.seen().first().icon, QMessageBox::Warning);
-    QCOMPARE(sourceIndex(QStringLiteral("carol")).isValid(), !removed);
-    QVERIFY(sourceIndex(QStringLiteral("dave")).isValid());
-    QCOMPARE(action("actionSave")->isEnabled(), removed);
+    QCOMPARE(m_f.source(QStringLiteral("carol")).isValid(), !removed);
+    QVERIFY(m_f.source(QStringLiteral("dave")).isValid());
+    QCOMPARE(m_f.action("actionSave")->isEnabled(), removed);
     if (removed)
-        QVERIFY(!action("actionDelete_user")->isVisible());
+        QVERIFY(!m_f.action("actionDelete_user")->isVisible());
 }
 
 void TestMainWindow::loginCheckFollowsEdits()
 {
-    select(QStringLiteral("bob"));
-    const QTreeWidget *tree = m_window->loginCheckDock()->findingsTree();
+    QVERIFY(m_f.select(QStringLiteral("bob")));
+    const QTreeWidget *tree = m_f.window->loginCheckDock()->findingsTree();
     const auto verdict = [tree] {
         // Server first, then the user with the verdict as first child.
         const QTreeWidgetItem *user = tree->topLevelItem(1);
@@ -334,8 +269,7 @@ void TestMainWindow::loginCheckFollowsEdits()
     QCOMPARE(tree->topLevelItem(0)->text(LoginCheckDock::CheckColumn), QStringLiteral("Server"));
     QCOMPARE(verdict()->text(LoginCheckDock::ResultColumn), QStringLiteral("allowed"));
 
-    QVERIFY(m_window->model()->setData(sourceIndex(QStringLiteral("bob"), TreeModel::StatusColumn),
-                                       QStringLiteral("denied")));
+    QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
     QTRY_VERIFY(verdict() && verdict()->text(LoginCheckDock::ResultColumn) == QLatin1String("denied"));
     QCOMPARE(verdict()->text(LoginCheckDock::WhereColumn), QStringLiteral("FTP userlist file"));
     QVERIFY(verdict()->text(LoginCheckDock::MessageColumn).startsWith(QLatin1String("***Result: FALSE.")));

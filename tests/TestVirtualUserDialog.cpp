@@ -1,104 +1,24 @@
-#include "FixtureRoot.h"
 #include "ModalHelper.h"
 #include "TestMain.h"
+#include "WindowFixture.h"
 #include "accounts/AccountStore.h"
-#include "app/CMainWindow.h"
-#include "app/Server.h"
 #include "policy/FtpServerConfig.h"
-#include "usertable/CMainTreeView.h"
-#include "usertable/CUsersFilterProxyModel.h"
 #include "usertable/CreateVUserDialog.h"
-#include "usertable/TreeModel.h"
 
 #include <QAction>
 #include <QCheckBox>
 #include <QLineEdit>
 #include <QPushButton>
-#include <QSettings>
-#include <QTemporaryDir>
-
-#include <memory>
 
 namespace {
 
 const QString createTitle = QStringLiteral("Create virtual user");
 const QString editTitle = QStringLiteral("Edit virtual user");
 const QString selectMessage = QStringLiteral("Please, select virtual user which has to be changed.");
-const QString storedDb = QStringLiteral("/etc/vsftpd/virtual.db");
 
-QStringList fields(const CreateVUserDialog *dialog)
-{
-    return {dialog->nameLineEdit()->text(), dialog->passwordLineEdit()->text(), dialog->confirmationLineEdit()->text()};
-}
-
-} // namespace
-
-// The virtual user dialogs run from the main window over a fixture root
-// with the virtual users carol ("c") and dave ("d"), and what Save then
-// leaves in the database that pam_userdb reads.
-class TestVirtualUserDialog : public QObject
-{
-    Q_OBJECT
-
-private Q_SLOTS:
-    void initTestCase();
-    void init();
-    void cleanup();
-    void validation_data();
-    void validation();
-    void add_data();
-    void add();
-    void edit_data();
-    void edit();
-    void noVirtualUserSelected_data();
-    void noVirtualUserSelected();
-
-private:
-    // Types into the dialog (the first keystroke is what releases Ok), then
-    // presses Ok; okHeldBack tells whether Ok was disabled before.
-    ModalHelper::Action fillAndAccept(const QStringList &values, bool *okHeldBack = nullptr);
-    void select(const QString &name);
-    QStringList database() const;
-
-    QTemporaryDir m_config;
-    std::unique_ptr<Server> m_server;
-    std::unique_ptr<FixtureRoot> m_root;
-    std::unique_ptr<CMainWindow> m_window;
-};
-
-void TestVirtualUserDialog::initTestCase()
-{
-    QVERIFY(m_config.isValid());
-    qputenv("XDG_CONFIG_HOME", QFile::encodeName(m_config.path()));
-    QApplication::setQuitOnLastWindowClosed(false);
-    m_server = std::make_unique<Server>(QDBusConnection(QStringLiteral("ftpconfig-no-bus")));
-}
-
-void TestVirtualUserDialog::init()
-{
-    QSettings().clear();
-    m_root = std::make_unique<FixtureRoot>();
-    const QByteArray userdb = "auth sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
-                              "account sufficient pam_userdb.so db=/etc/vsftpd/virtual\n";
-    QVERIFY(m_root->write({{"/etc/pam.d/vsftpd", userdb + FixtureRoot::defaults().value("/etc/pam.d/vsftpd")}}));
-    QVERIFY(m_root->writeVirtualUsers(storedDb, {{"carol", "c"}, {"dave", "d"}}));
-    qputenv("FTPCONFIG_ROOT", QFile::encodeName(m_root->path()));
-    m_window = std::make_unique<CMainWindow>(*m_server);
-    QVERIFY(m_window->model());
-    m_window->show();
-    QVERIFY(QTest::qWaitForWindowExposed(m_window.get()));
-}
-
-void TestVirtualUserDialog::cleanup()
-{
-    m_window.reset();
-    m_root.reset();
-    QCoreApplication::sendPostedEvents(nullptr, QEvent::DeferredDelete);
-    const QWidgetList left = QApplication::topLevelWidgets();
-    QVERIFY2(left.isEmpty(), left.isEmpty() ? "" : left.first()->metaObject()->className());
-}
-
-ModalHelper::Action TestVirtualUserDialog::fillAndAccept(const QStringList &values, bool *okHeldBack)
+// Types into the dialog (the first keystroke is what releases Ok), then
+// presses Ok; okHeldBack tells whether Ok was disabled before.
+ModalHelper::Action fillAndAccept(const QStringList &values, bool *okHeldBack = nullptr)
 {
     return [values, okHeldBack](QWidget *widget) {
         auto *dialog = qobject_cast<CreateVUserDialog *>(widget);
@@ -114,21 +34,55 @@ ModalHelper::Action TestVirtualUserDialog::fillAndAccept(const QStringList &valu
     };
 }
 
-void TestVirtualUserDialog::select(const QString &name)
+QStringList fields(const CreateVUserDialog *dialog)
 {
-    const QModelIndex index = m_window->proxy()->mapFromSource(m_window->model()->indexOfUser(name));
-    QVERIFY2(name.isEmpty() || index.isValid(), qPrintable(name));
-    m_window->view()->setCurrentIndex(index);
+    return {dialog->nameLineEdit()->text(), dialog->passwordLineEdit()->text(), dialog->confirmationLineEdit()->text()};
 }
 
-QStringList TestVirtualUserDialog::database() const
+} // namespace
+
+// The virtual user dialogs run from the main window of the window fixture
+// (carol "c" and dave "d"), and what Save then leaves in the database that
+// pam_userdb reads.
+class TestVirtualUserDialog : public QObject
 {
-    const AccountStore store(storedDb.toUtf8(), RootDirectory(m_root->path()), AccountStore::Access::ReadOnly);
-    QStringList records;
-    for (const auto &[name, record] : store.virtualUsers())
-        records << QString::fromUtf8(name + '=' + record.password);
-    return records;
-}
+    Q_OBJECT
+
+private Q_SLOTS:
+    void initTestCase()
+    {
+        QVERIFY(m_f.setUp());
+    }
+    void init()
+    {
+        QVERIFY(m_f.open());
+    }
+    void cleanup()
+    {
+        QCOMPARE(m_f.close(), QString());
+    }
+    void validation_data();
+    void validation();
+    void add_data();
+    void add();
+    void edit_data();
+    void edit();
+    void noVirtualUserSelected_data();
+    void noVirtualUserSelected();
+
+private:
+    QStringList database() const
+    {
+        const AccountStore store(WindowFixture::virtualDb.toUtf8(), RootDirectory(m_f.root->path()),
+                                 AccountStore::Access::ReadOnly);
+        QStringList records;
+        for (const auto &[name, record] : store.virtualUsers())
+            records << QString::fromUtf8(name + '=' + record.password);
+        return records;
+    }
+
+    WindowFixture m_f;
+};
 
 void TestVirtualUserDialog::validation_data()
 {
@@ -142,22 +96,21 @@ void TestVirtualUserDialog::validation_data()
     const auto unusable = [](const QString &name, const char *reason) {
         return QStringLiteral("Virtual user name \"%1\" cannot be used: %2.").arg(name, QLatin1String(reason));
     };
-    QTest::newRow("mismatch before empty name") << QStringList{"", "a", "b"} << mismatch << QStringList{"", "", ""};
-    QTest::newRow("mismatch keeps name") << QStringList{"eve", "", "b"} << mismatch << QStringList{"eve", "", ""};
-    QTest::newRow("empty password before empty name")
-        << QStringList{"", "", ""} << emptyPassword << QStringList{"", "", ""};
-    QTest::newRow("empty name keeps passwords") << QStringList{"", "p", "p"} << emptyName << QStringList{"", "p", "p"};
-    const QStringList bad[] = {{"a/b", "the name contains \"/\""},
-                               {".eve", "the name begins with \".\""},
-                               {"eve smith", "the name contains a blank"},
-                               {QStringLiteral("eve\u00a0smith"), "the name contains a blank"},
-                               {"eve\nsmith", "the name contains a line break"},
-                               {"eve\tsmith", "the name contains a control character"},
-                               {QStringLiteral("eve\u0085"), "the name contains a control character"}};
+    QTest::newRow("mismatch before empty name") << strings("", "a", "b") << mismatch << strings("", "", "");
+    QTest::newRow("mismatch keeps name") << strings("eve", "", "b") << mismatch << strings("eve", "", "");
+    QTest::newRow("empty password before empty name") << strings("", "", "") << emptyPassword << strings("", "", "");
+    QTest::newRow("empty name keeps passwords") << strings("", "p", "p") << emptyName << strings("", "p", "p");
+    const QStringList bad[] = {strings("a/b", "the name contains \"/\""),
+                               strings(".eve", "the name begins with \".\""),
+                               strings("eve smith", "the name contains a blank"),
+                               strings("eve\u00a0smith", "the name contains a blank"),
+                               strings("eve\nsmith", "the name contains a line break"),
+                               strings("eve\tsmith", "the name contains a control character"),
+                               strings("eve\u0085", "the name contains a control character")};
     for (const QStringList &row : bad) {
+        const QStringList typed = QStringList{row.at(0)} + strings("p", "p");
         QTest::addRow("refused %d: %s", int(&row - bad), qPrintable(row.at(1)))
-            << QStringList{row.at(0), "p", "p"} << unusable(row.at(0), qPrintable(row.at(1)))
-            << QStringList{row.at(0), "p", "p"};
+            << typed << unusable(row.at(0), qPrintable(row.at(1))) << typed;
     }
 }
 
@@ -183,15 +136,15 @@ void TestVirtualUserDialog::validation()
         seenAgain = fields(qobject_cast<CreateVUserDialog *>(widget));
         ModalHelper::press(widget, QDialogButtonBox::Cancel);
     });
-    m_window->addUser();
+    m_f.window->addUser();
     QVERIFY2(modal.done(), qPrintable(modal.report()));
 
     QVERIFY(okHeldBack);
     QVERIFY(echoShown);
     QCOMPARE(modal.seen().at(1).icon, QMessageBox::Warning);
     QCOMPARE(seenAgain, reopened);
-    QVERIFY(!m_window->findChild<QAction *>(QStringLiteral("actionSave"))->isEnabled());
-    QCOMPARE(m_window->model()->config().virtualUserNames().size(), 2);
+    QVERIFY(!m_f.action("actionSave")->isEnabled());
+    QCOMPARE(m_f.window->model()->config().virtualUserNames().size(), 2);
 }
 
 void TestVirtualUserDialog::add_data()
@@ -201,13 +154,13 @@ void TestVirtualUserDialog::add_data()
     QTest::addColumn<QString>("message");
     QTest::addColumn<QStringList>("saved");
 
-    QTest::newRow("new user") << QString() << QStringList{"eve", "secret", "secret"} << QString()
-                              << QStringList{"carol=c", "dave=d", "eve=secret"};
-    QTest::newRow("existing name") << QString() << QStringList{"carol", "x", "x"}
+    QTest::newRow("new user") << QString() << strings("eve", "secret", "secret") << QString()
+                              << strings("carol=c", "dave=d", "eve=secret");
+    QTest::newRow("existing name") << QString() << strings("carol", "x", "x")
                                    << QStringLiteral("User carol allready exists in users database.")
-                                   << QStringList{"carol=c", "dave=d"};
-    QTest::newRow("deleted name again") << QStringLiteral("dave") << QStringList{"dave", "new", "new"} << QString()
-                                        << QStringList{"carol=c", "dave=new"};
+                                   << strings("carol=c", "dave=d");
+    QTest::newRow("deleted name again") << QStringLiteral("dave") << strings("dave", "new", "new") << QString()
+                                        << strings("carol=c", "dave=new");
 }
 
 void TestVirtualUserDialog::add()
@@ -219,20 +172,20 @@ void TestVirtualUserDialog::add()
 
     ModalHelper modal;
     if (!deletedFirst.isEmpty()) {
-        select(deletedFirst);
+        QVERIFY(m_f.select(deletedFirst));
         modal.expect(QString(), QStringLiteral("OK"));
-        m_window->deleteUser();
+        m_f.window->deleteUser();
     }
     modal.expect(createTitle, fillAndAccept(typed));
     if (!message.isNull())
         modal.expect(message, QStringLiteral("OK"));
-    m_window->addUser();
+    m_f.window->addUser();
     QVERIFY2(modal.done(), qPrintable(modal.report()));
 
-    QAction *save = m_window->findChild<QAction *>(QStringLiteral("actionSave"));
+    QAction *save = m_f.action("actionSave");
     QCOMPARE(save->isEnabled(), message.isNull());
     if (message.isNull()) {
-        QCOMPARE(m_window->model()->userName(m_window->proxy()->mapToSource(m_window->view()->currentIndex())),
+        QCOMPARE(m_f.window->model()->userName(m_f.window->proxy()->mapToSource(m_f.window->view()->currentIndex())),
                  typed.at(0));
         save->trigger();
     }
@@ -245,13 +198,12 @@ void TestVirtualUserDialog::edit_data()
     QTest::addColumn<QString>("message");
     QTest::addColumn<QStringList>("saved");
 
-    QTest::newRow("new password") << QStringList{"carol", "c2", "c2"} << QString() << QStringList{"carol=c2", "dave=d"};
-    QTest::newRow("new name") << QStringList{"eve", "c", "c"} << QString() << QStringList{"dave=d", "eve=c"};
-    QTest::newRow("new name and password")
-        << QStringList{"eve", "e", "e"} << QString() << QStringList{"dave=d", "eve=e"};
+    QTest::newRow("new password") << strings("carol", "c2", "c2") << QString() << strings("carol=c2", "dave=d");
+    QTest::newRow("new name") << strings("eve", "c", "c") << QString() << strings("dave=d", "eve=c");
+    QTest::newRow("new name and password") << strings("eve", "e", "e") << QString() << strings("dave=d", "eve=e");
     QTest::newRow("name of another user")
-        << QStringList{"dave", "c", "c"} << QStringLiteral("User dave allready exists in users database.")
-        << QStringList{"carol=c", "dave=d"};
+        << strings("dave", "c", "c") << QStringLiteral("User dave allready exists in users database.")
+        << strings("carol=c", "dave=d");
 }
 
 void TestVirtualUserDialog::edit()
@@ -260,7 +212,7 @@ void TestVirtualUserDialog::edit()
     QFETCH(QString, message);
     QFETCH(QStringList, saved);
 
-    select(QStringLiteral("carol"));
+    QVERIFY(m_f.select(QStringLiteral("carol")));
     QStringList shown;
     ModalHelper modal;
     modal.expect(editTitle, [&](QWidget *widget) {
@@ -269,15 +221,15 @@ void TestVirtualUserDialog::edit()
     });
     if (!message.isNull())
         modal.expect(message, QStringLiteral("OK"));
-    m_window->editUser();
+    m_f.window->editUser();
     QVERIFY2(modal.done(), qPrintable(modal.report()));
 
-    QCOMPARE(shown, (QStringList{"carol", "c", "c"}));
-    TreeModel *model = m_window->model();
+    QCOMPARE(shown, (strings("carol", "c", "c")));
+    TreeModel *model = m_f.window->model();
     const bool renamed = message.isNull() && typed.at(0) != QLatin1String("carol");
     QCOMPARE(model->indexOfUser(QStringLiteral("carol")).isValid(), !renamed);
     QVERIFY(model->indexOfUser(typed.at(0)).isValid());
-    QAction *save = m_window->findChild<QAction *>(QStringLiteral("actionSave"));
+    QAction *save = m_f.action("actionSave");
     QCOMPARE(save->isEnabled(), message.isNull());
     save->trigger();
     QCOMPARE(database(), saved);
@@ -300,21 +252,17 @@ void TestVirtualUserDialog::noVirtualUserSelected()
     QFETCH(bool, editing);
     QFETCH(QString, row);
 
-    if (row == QLatin1String("Virtual users"))
-        m_window->view()->setCurrentIndex(
-            m_window->proxy()->mapFromSource(m_window->model()->indexOfUser(QStringLiteral("carol")).parent()));
-    else
-        select(row);
+    QVERIFY(m_f.select(row));
     ModalHelper modal;
     modal.expect(selectMessage, QStringLiteral("OK"));
     if (editing)
-        m_window->editUser();
+        m_f.window->editUser();
     else
-        m_window->deleteUser();
+        m_f.window->deleteUser();
     QVERIFY2(modal.done(), qPrintable(modal.report()));
     QCOMPARE(modal.seen().first().icon, QMessageBox::Warning);
-    QCOMPARE(m_window->model()->config().virtualUserNames().size(), 2);
-    QVERIFY(!m_window->findChild<QAction *>(QStringLiteral("actionSave"))->isEnabled());
+    QCOMPARE(m_f.window->model()->config().virtualUserNames().size(), 2);
+    QVERIFY(!m_f.action("actionSave")->isEnabled());
 }
 
 FTPCONFIG_TEST_MAIN(TestVirtualUserDialog)
