@@ -1,20 +1,25 @@
 // Opens the main window on the root in FTPCONFIG_ROOT the way the program
 // does, and saves pictures into the directory named on the command line:
 // the window with a refused user selected, its filter menu, the refusal box
-// of an edit that cannot be repaired, the PAM problem dialog over the
-// window, the Login check dock, and the permissions editor.
+// of an edit that cannot be repaired, the Login check dock, the permissions
+// editor, then each dialog and box of the engine's questions, the way the
+// program shows them.
 #include "ModalHelper.h"
 #include "app/CMainWindow.h"
 #include "app/LoginCheckDock.h"
 #include "app/VexIntegration.h"
 #include "common/AppStrings.h"
 #include "dialogs/GuiInteraction.h"
+#include "policy/FtpServerConfig.h"
 #include "usertable/CMainTreeView.h"
 #include "usertable/CUsersFilterProxyModel.h"
+#include "usertable/CreateVUserDialog.h"
 #include "usertable/TreeModel.h"
 
+#include <QAbstractButton>
 #include <QApplication>
 #include <QDir>
+#include <QLineEdit>
 #include <QMenu>
 #include <QPixmap>
 #include <QTest>
@@ -23,11 +28,46 @@
 
 namespace {
 
+bool g_saved = true;
+QDir g_output;
+
+void save(QWidget *widget, const QString &name)
+{
+    const QString file = g_output.filePath(name + QStringLiteral(".png"));
+    if (!widget->grab().save(file)) {
+        std::fprintf(stderr, "cannot write %s\n", qPrintable(file));
+        g_saved = false;
+    }
+}
+
+// Saves the widget, a box with details a second time with them open, and
+// presses the button.
+ModalHelper::Action shot(const QString &name, const QString &button)
+{
+    return [name, button](QWidget *widget) {
+        save(widget, name);
+        if (auto *box = qobject_cast<QMessageBox *>(widget); box && !box->detailedText().isEmpty()) {
+            for (QAbstractButton *toggle : box->findChildren<QAbstractButton *>()) {
+                if (box->buttonRole(toggle) == QMessageBox::ActionRole)
+                    toggle->click();
+            }
+            save(widget, name + QStringLiteral("-details"));
+        }
+        ModalHelper::press(widget, button);
+    };
+}
+
 QModelIndex userIndex(TreeModel &model, const QString &name, int column = TreeModel::UsersColumn)
 {
     const QModelIndexList found
         = model.match(model.index(0, 0), Qt::DisplayRole, name, 1, Qt::MatchExactly | Qt::MatchRecursive);
     return found.isEmpty() ? QModelIndex() : found.first().siblingAtColumn(column);
+}
+
+Interaction::Question question(const QString &text, const QString &informative, const QString &detailed,
+                               QList<Interaction::Button> buttons, const QString &acceptText = {})
+{
+    return {{Interaction::Icon::Question, QString(), text, informative, detailed}, buttons, acceptText, {}};
 }
 
 } // namespace
@@ -40,25 +80,16 @@ int main(int argc, char **argv)
         std::fprintf(stderr, "usage: windowshots <output directory> [selected user] [user refused on edit]\n");
         return 2;
     }
-    const QDir output(arguments.at(1));
+    g_output = QDir(arguments.at(1));
     const QString selected = arguments.value(2, QStringLiteral("mallory"));
     const QString refused = arguments.value(3, QStringLiteral("mallory"));
-    if (!QDir().mkpath(output.path())) {
-        std::fprintf(stderr, "cannot create %s\n", qPrintable(output.path()));
+    if (!QDir().mkpath(g_output.path())) {
+        std::fprintf(stderr, "cannot create %s\n", qPrintable(g_output.path()));
         return 1;
     }
     QApplication::setWindowIcon(
         QIcon::fromTheme(QStringLiteral("ftp"), QIcon(QPixmap(QStringLiteral(":/prefix/icons/app-icon.png")))));
     vexInit("1.2.13", "Program to control FTP server VSFTPD");
-
-    bool saved = true;
-    const auto save = [&](QWidget *widget, const QString &name) {
-        const QString file = output.filePath(name + QStringLiteral(".png"));
-        if (!widget->grab().save(file)) {
-            std::fprintf(stderr, "cannot write %s\n", qPrintable(file));
-            saved = false;
-        }
-    };
 
     // The size of a first run, then one with room for the dock.
     CMainWindow window;
@@ -91,29 +122,69 @@ int main(int argc, char **argv)
     // Every question the edit asks on the way is answered with its
     // refusing button; the refusal box is the picture.
     ModalHelper modal(10000);
-    modal.expect(QStringLiteral("Unable to change access status."), [&](QWidget *box) {
-        save(box, QStringLiteral("window-refusal-box"));
-        ModalHelper::press(box, QStringLiteral("OK"));
-    });
+    const QString refusal = QStringLiteral("Unable to change access status.");
+    modal.expect(refusal, shot(QStringLiteral("window-refusal-box"), QStringLiteral("OK")));
     model.setData(userIndex(model, refused, TreeModel::StatusColumn), QStringLiteral("allowed"));
 
-    modal.expect(QStringLiteral("PAM configuration problem"), [&](QWidget *dialog) {
-        save(dialog, QStringLiteral("window-pam-dialog"));
-        ModalHelper::press(dialog, QStringLiteral("Skip"));
-    });
-    GuiInteraction().askPamProblem();
+    const QString pamTitle = QStringLiteral("PAM configuration problem");
+    modal.expect(pamTitle, shot(QStringLiteral("window-pam-dialog"), QStringLiteral("Skip")));
+    GuiInteraction gui;
+    gui.askPamProblem();
 
     // The mode cell's editor over the window, on the anonymous row.
-    modal.expect(QStringLiteral("Dialog"), [&](QWidget *dialog) {
-        save(dialog, QStringLiteral("permissions-editor"));
-        ModalHelper::press(dialog, QStringLiteral("Cancel"));
-    });
+    modal.expect(QStringLiteral("Dialog"), shot(QStringLiteral("permissions-editor"), QStringLiteral("Cancel")));
     window.view()->edit(
         window.proxy()->mapFromSource(userIndex(model, AppStrings::instance().anonymousUsers, TreeModel::ModeColumn)));
+
+    // The dialogs alone.
+    window.hide();
+    modal.expect(pamTitle, shot(QStringLiteral("pam-dialog"), QStringLiteral("Skip")));
+    gui.askPamProblem();
+
+    modal.expect(QString(), shot(QStringLiteral("file-input-dialog"), QStringLiteral("Cancel")));
+    gui.askPath(QStringLiteral("Virtual users database file defined in vsftpd PAM configuration is not found.\nIt "
+                               "means, that FTP config was unable to create the following db file: "
+                               "/var/lib/ftpconfig/vsftpd_virtual_users.db\nPlease, define new db file path."),
+                QStringLiteral("/var/lib/ftpconfig/vsftpd_virtual_users.db"));
+
+    modal.expect(QString(), shot(QStringLiteral("select-owner-dialog"), QStringLiteral("Cancel")));
+    gui.chooseOwner({QStringLiteral("root"), QStringLiteral("daemon"), QStringLiteral("ftp"), QStringLiteral("bob")});
+
+    modal.expect(refusal, shot(QStringLiteral("refusal-box"), QStringLiteral("OK")));
+    gui.show({Interaction::Icon::Warning, QString(), refusal, QStringLiteral("Failed check type: FTP userlist file"),
+              QStringLiteral("***Result: FALSE. Check: userlist file contains bob, userlist file mode = black users")});
+
+    const AccessFailure failure{FailureKind::Filesystem,
+                                QStringLiteral("***Result: FALSE. Check: user home directory /srv/ftp/bob does not "
+                                               "exist.")};
+    modal.expect(failure.message, shot(QStringLiteral("failure-dialog"), QStringLiteral("OK")));
+    showFailureDialog(gui, failure);
+
+    const auto create = question(QStringLiteral("User home directory /srv/ftp/bob does not exist."),
+                                 QStringLiteral("Do you want to create it?"), QString(),
+                                 {Interaction::Button::Accept, Interaction::Button::Cancel}, QStringLiteral("Create"));
+    modal.expect(create.message.text, shot(QStringLiteral("create-question"), QStringLiteral("Cancel")));
+    gui.ask(create);
+
+    const auto permissions
+        = question(QStringLiteral("User may download, but folder has no READ permission for user ftp"),
+                   QStringLiteral("Let me fix it?"),
+                   QStringLiteral("Detected mapped system user: ftp\nFolder owner: root\nFolder group: root\n\n"
+                                  "Current permissions:\nrwx------\nNew permissions:\nrwx---r--"),
+                   {Interaction::Button::Yes, Interaction::Button::No});
+    modal.expect(permissions.message.text, shot(QStringLiteral("permissions-question"), QStringLiteral("No")));
+    gui.ask(permissions);
+
+    CreateVUserDialog virtualUser;
+    virtualUser.nameLineEdit()->setText(QStringLiteral("eve"));
+    virtualUser.passwordLineEdit()->setText(QStringLiteral("secret"));
+    virtualUser.confirmationLineEdit()->setText(QStringLiteral("secret"));
+    modal.expect(virtualUser.windowTitle(), shot(QStringLiteral("virtual-user-dialog"), QStringLiteral("Cancel")));
+    virtualUser.run();
 
     if (!modal.done()) {
         std::fprintf(stderr, "%s\n", qPrintable(modal.report()));
         return 1;
     }
-    return saved ? 0 : 1;
+    return g_saved ? 0 : 1;
 }
