@@ -4,6 +4,7 @@
 #include "FixtureRoot.h"
 #include "ScriptedInteraction.h"
 #include "TestMain.h"
+#include "TestStrings.h"
 #include "policy/FtpServerConfig.h"
 #include "usertable/CUsersFilterProxyModel.h"
 #include "usertable/TreeModel.h"
@@ -23,6 +24,9 @@ const QByteArray UserdbPam = "auth sufficient pam_userdb.so db=/var/lib/ftpconfi
                              "auth required pam_unix.so\n"
                              "account required pam_unix.so\n";
 
+const QStringList localUsers
+    = strings("alice", "bob", "doublebang", "ftp", "locked", "lockedhash", "nobody", "root", "starred");
+
 struct Table
 {
     FixtureRoot root;
@@ -30,20 +34,21 @@ struct Table
     std::unique_ptr<TreeModel> model;
     std::unique_ptr<QAbstractItemModelTester> tester;
 
-    bool load(const QMap<QString, QByteArray> &files = {})
+    bool load(const FileMap &files = {})
     {
         // With nopriv_user's account and bob's home, the server itself
         // lets bob and the anonymous user in.
-        QMap<QString, QByteArray> all{
-            {"/etc/pam.d/vsftpd", UserdbPam},
-            {"/etc/passwd",
-             FixtureRoot::defaults()["/etc/passwd"] + "nobody:x:65534:65534::/nonexistent:/usr/sbin/nologin\n"},
-            {"/srv/ftp/.keep", ""},
-            {"/var/run/vsftpd/empty/.keep", ""},
-            {"/home/bob/.keep", ""}};
+        FileMap all{{QStringLiteral("/etc/pam.d/vsftpd"), UserdbPam},
+                    {QStringLiteral("/etc/passwd"),
+                     FixtureRoot::defaults()[QStringLiteral("/etc/passwd")]
+                         + "nobody:x:65534:65534::/nonexistent:/usr/sbin/nologin\n"},
+                    {QStringLiteral("/srv/ftp/.keep"), ""},
+                    {QStringLiteral("/var/run/vsftpd/empty/.keep"), ""},
+                    {QStringLiteral("/home/bob/.keep"), ""}};
         all.insert(files);
         return root.write(all)
-            && root.writeVirtualUsers("/var/lib/ftpconfig/vsftpd_virtual_users.db", {{"vic", "v"}, {"wendy", "w"}})
+            && root.writeVirtualUsers(QStringLiteral("/var/lib/ftpconfig/vsftpd_virtual_users.db"),
+                                      {{"vic", "v"}, {"wendy", "w"}})
             && reload();
     }
 
@@ -55,7 +60,7 @@ struct Table
         model.reset();
         qputenv("FTPCONFIG_ROOT", QFile::encodeName(root.path()));
         CaptureStream out(std::cout);
-        model = std::make_unique<TreeModel>(QStringList{"users", "status", "directory", "mode", "server"}, interaction);
+        model = std::make_unique<TreeModel>(strings("users", "status", "directory", "mode", "server"), interaction);
         tester = std::make_unique<QAbstractItemModelTester>(model.get(),
                                                             QAbstractItemModelTester::FailureReportingMode::QtTest);
         return true;
@@ -106,24 +111,23 @@ void TestTreeModel::tree()
     Table table;
     QVERIFY(table.load());
     const TreeModel &model = *table.model;
-    QCOMPARE(childNames(model, {}), QStringList{"Everybody"});
+    QCOMPARE(childNames(model, {}), strings("Everybody"));
     const QModelIndex everybody = model.index(0, 0);
-    QCOMPARE(childNames(model, everybody), (QStringList{"Local users", "Virtual users", "Anonymous users"}));
-    QCOMPARE(childNames(model, model.index(0, 0, everybody)),
-             (QStringList{"alice", "bob", "doublebang", "ftp", "locked", "lockedhash", "nobody", "root", "starred"}));
-    QCOMPARE(childNames(model, model.index(1, 0, everybody)), (QStringList{"vic", "wendy"}));
+    QCOMPARE(childNames(model, everybody), (strings("Local users", "Virtual users", "Anonymous users")));
+    QCOMPARE(childNames(model, model.index(0, 0, everybody)), localUsers);
+    QCOMPARE(childNames(model, model.index(1, 0, everybody)), (strings("vic", "wendy")));
     QCOMPARE(model.columnCount(), 5);
-    QCOMPARE(model.headerData(4, Qt::Horizontal).toString(), QString("server"));
+    QCOMPARE(model.headerData(4, Qt::Horizontal).toString(), QStringLiteral("server"));
     // Group rows have a name and the arrow, nothing else, and edit nothing.
     for (const QModelIndex &group : {everybody, model.index(0, 0, everybody), model.index(1, 0, everybody)}) {
         QVERIFY(sameIcon(group.data(Qt::DecorationRole), ":/prefix/icons/arrow_right.png"));
         QCOMPARE(group.siblingAtColumn(1).data().toString(), QString());
         QVERIFY(!(model.flags(group.siblingAtColumn(1)) & Qt::ItemIsEditable));
     }
-    QVERIFY(model.isInVirtualGroup(table.user("vic")));
-    QVERIFY(!model.isInVirtualGroup(table.user("bob")));
-    QVERIFY(model.flags(table.user("bob", TreeModel::StatusColumn)) & Qt::ItemIsEditable);
-    QVERIFY(!(model.flags(table.user("bob", TreeModel::ServerColumn)) & Qt::ItemIsEditable));
+    QVERIFY(model.isInVirtualGroup(table.user(QStringLiteral("vic"))));
+    QVERIFY(!model.isInVirtualGroup(table.user(QStringLiteral("bob"))));
+    QVERIFY(model.flags(table.user(QStringLiteral("bob"), TreeModel::StatusColumn)) & Qt::ItemIsEditable);
+    QVERIFY(!(model.flags(table.user(QStringLiteral("bob"), TreeModel::ServerColumn)) & Qt::ItemIsEditable));
     QVERIFY(!table.model->hasUnsavedChanges());
     QCOMPARE(table.interaction.records.size(), 0);
 }
@@ -162,7 +166,7 @@ void TestTreeModel::users()
     QFETCH(QString, server);
 
     Table table;
-    QVERIFY(table.load({{"/etc/vsftpd.conf", "listen=YES\nlocal_enable=YES\nanonymous_enable=YES\n"}}));
+    QVERIFY(table.load({{QStringLiteral("/etc/vsftpd.conf"), "listen=YES\nlocal_enable=YES\nanonymous_enable=YES\n"}}));
     QCOMPARE(table.cell(name, TreeModel::StatusColumn), status);
     QCOMPARE(table.model->failure(table.user(name))->kind, static_cast<FailureKind>(kind));
     QVERIFY(
@@ -203,22 +207,22 @@ void TestTreeModel::edits_data()
         << "root" << 1 << "allowed"
         << "denied"
         << QStringList{refused
-                       + "/etc/passwd or /etc/shadow|***Result: FALSE. Check: user root  has bad passwd in "
-                         "/etc/shadow (* or !)."}
+                       + QLatin1String("/etc/passwd or /etc/shadow|***Result: FALSE. Check: user root  has bad "
+                                       "passwd in /etc/shadow (* or !).")}
         << false;
     QTest::newRow("allow a virtual user: guest mode") << "vic" << 1 << "allowed"
                                                       << "allowed" << QStringList() << true;
     QTest::newRow("anonymous off") << "Anonymous users" << 1 << "denied"
                                    << "denied" << QStringList() << true;
     QTest::newRow("no such status") << "bob" << 1 << "maybe"
-                                    << "allowed"
-                                    << QStringList{"|Unable to set data. Data is invalid. Reason is unknown"} << false;
+                                    << "allowed" << strings("|Unable to set data. Data is invalid. Reason is unknown")
+                                    << false;
     QTest::newRow("rename a local user")
         << "bob" << 0 << "robert"
-        << "bob" << QStringList{"|You can change only virtual user names. Skipping change bob to robert"} << false;
+        << "bob" << strings("|You can change only virtual user names. Skipping change bob to robert") << false;
     QTest::newRow("rename a virtual user to a bad name")
         << "vic" << 0 << ".hidden"
-        << "vic" << QStringList{"|Unable to set data. Data is invalid.||the name begins with \".\""} << false;
+        << "vic" << strings("|Unable to set data. Data is invalid.||the name begins with \".\"") << false;
     QTest::newRow("rights") << "bob" << 3 << "download, upload"
                             << "download, upload" << QStringList() << true;
 }
@@ -233,7 +237,7 @@ void TestTreeModel::edits()
     QFETCH(bool, unsaved);
 
     Table table;
-    QVERIFY(table.load({{"/etc/vsftpd.d/allowed_user_list.conf", "alice\n"}}));
+    QVERIFY(table.load({{QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf"), "alice\n"}}));
     QSignalSpy changed(table.model.get(), &QAbstractItemModel::dataChanged);
     CaptureStream out(std::cout);
     QCOMPARE(table.model->setData(table.user(name, column), value), unsaved);
@@ -249,19 +253,19 @@ void TestTreeModel::saveWritesAndClears()
     Table table;
     QVERIFY(table.load());
     CaptureStream out(std::cout);
-    QVERIFY(table.model->setData(table.user("bob", TreeModel::StatusColumn), "denied"));
+    QVERIFY(table.model->setData(table.user(QStringLiteral("bob"), TreeModel::StatusColumn), QStringLiteral("denied")));
     // A virtual user renamed in memory is written under the new name.
-    QVERIFY(table.model->setData(table.user("vic"), "victor"));
-    QVERIFY(table.user("victor").isValid());
+    QVERIFY(table.model->setData(table.user(QStringLiteral("vic")), QStringLiteral("victor")));
+    QVERIFY(table.user(QStringLiteral("victor")).isValid());
     QVERIFY(table.model->hasUnsavedChanges());
     table.model->onSave();
     QVERIFY(!table.model->hasUnsavedChanges());
-    QCOMPARE(table.root.readFile("/etc/vsftpd.d/allowed_user_list.conf"), QByteArray("bob\n"));
-    QVERIFY(table.root.readFile("/etc/vsftpd.conf").contains("userlist_enable=yes"));
+    QCOMPARE(table.root.readFile(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")), QByteArray("bob\n"));
+    QVERIFY(table.root.readFile(QStringLiteral("/etc/vsftpd.conf")).contains("userlist_enable=yes"));
     QVERIFY(table.reload());
-    QVERIFY(table.user("victor").isValid());
-    QVERIFY(!table.user("vic").isValid());
-    QCOMPARE(table.cell("bob", TreeModel::StatusColumn), QString("denied"));
+    QVERIFY(table.user(QStringLiteral("victor")).isValid());
+    QVERIFY(!table.user(QStringLiteral("vic")).isValid());
+    QCOMPARE(table.cell(QStringLiteral("bob"), TreeModel::StatusColumn), QStringLiteral("denied"));
 }
 
 void TestTreeModel::filters_data()
@@ -271,13 +275,12 @@ void TestTreeModel::filters_data()
     QTest::addColumn<bool>("allowed");
     QTest::addColumn<QStringList>("local");
 
-    const QStringList all{"alice", "bob", "doublebang", "ftp", "locked", "lockedhash", "nobody", "root", "starred"};
-    QTest::newRow("nothing hidden") << false << false << false << all;
+    QTest::newRow("nothing hidden") << false << false << false << localUsers;
     QTest::newRow("system users") << true << false << false
-                                  << QStringList{"alice", "bob", "doublebang", "locked", "lockedhash", "starred"};
+                                  << strings("alice", "bob", "doublebang", "locked", "lockedhash", "starred");
     QTest::newRow("denied") << false << true << false
-                            << QStringList{"alice", "bob", "doublebang", "ftp", "lockedhash", "nobody"};
-    QTest::newRow("allowed") << false << false << true << QStringList{"locked", "root", "starred"};
+                            << strings("alice", "bob", "doublebang", "ftp", "lockedhash", "nobody");
+    QTest::newRow("allowed") << false << false << true << strings("locked", "root", "starred");
     QTest::newRow("allowed and denied") << false << true << true << QStringList();
 }
 
@@ -298,7 +301,7 @@ void TestTreeModel::filters()
     proxy.setHideAllowedUsers(allowed);
     const QModelIndex everybody = proxy.index(0, 0);
     // Group rows are never hidden.
-    QCOMPARE(childNames(proxy, everybody).mid(0, 2), (QStringList{"Local users", "Virtual users"}));
+    QCOMPARE(childNames(proxy, everybody).mid(0, 2), (strings("Local users", "Virtual users")));
     QCOMPARE(childNames(proxy, proxy.index(0, 0, everybody)), local);
 }
 

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "FixtureRoot.h"
+#include "TestStrings.h"
 #include "app/CMainWindow.h"
 #include "app/Server.h"
 #include "usertable/CMainTreeView.h"
@@ -15,12 +16,6 @@
 #include <QTest>
 
 #include <memory>
-
-// A string list from UTF-8 literals, for the data tables.
-template <typename... Texts> QStringList strings(const Texts &...texts)
-{
-    return {QString::fromUtf8(texts)...};
-}
 
 // The main window as the program opens it, on a fixture root with the
 // virtual users carol ("c") and dave ("d") in /etc/vsftpd/virtual.db, the

@@ -1,0 +1,10 @@
+#pragma once
+
+#include <QStringList>
+
+// A string list from UTF-8 literals, for the data tables of tests built
+// without the implicit casts from ASCII.
+template <typename... Texts> QStringList strings(const Texts &...texts)
+{
+    return {QString::fromUtf8(texts)...};
+}
