@@ -77,6 +77,7 @@ private slots:
     void pamUserdb_data();
     void pamUserdb();
     void failureDialog();
+    void options();
 };
 
 void TestFtpServerConfig::initTestCase()
@@ -287,6 +288,31 @@ void TestFtpServerConfig::failureDialog()
     showFailureDialog(interaction, {FailureKind::UserlistFile, QStringLiteral("why")});
     QCOMPARE(interaction.texts(), QStringList{QStringLiteral("|why|Failure classification: FTP userlist file")});
     QCOMPARE(interaction.records.constFirst().message.icon, Interaction::Icon::Critical);
+}
+
+// The options dialog's edits: a set or a removal marks the configuration
+// modified, a removal of nothing does not; a new chroot list is read once
+// the options are applied.
+void TestFtpServerConfig::options()
+{
+    EngineFixture engine;
+    QVERIFY(engine.load({{QStringLiteral("/etc/vsftpd.conf"), "listen=YES\nlocal_enable=YES\nchroot_list_enable=YES\n"},
+                         {QStringLiteral("/etc/other.chroot_list"), "bob\n"}}));
+    FtpServerConfig &config = *engine.config;
+    config.setModified(false);
+    config.removeOption("chroot_local_user");
+    QVERIFY(!config.isModified());
+    QVERIFY(!config.isChrooted("bob"));
+    config.setOption("chroot_list_file", "/etc/other.chroot_list");
+    QVERIFY(config.isModified());
+    config.optionsChanged();
+    QVERIFY(config.isChrooted("bob"));
+    QVERIFY(!config.isChrooted("alice"));
+    config.setModified(false);
+    config.removeOption("chroot_list_file");
+    QVERIFY(config.isModified());
+    config.optionsChanged();
+    QVERIFY(!config.isChrooted("bob"));
 }
 
 FTPCONFIG_TEST_GUILESS_MAIN(TestFtpServerConfig)
