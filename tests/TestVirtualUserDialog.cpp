@@ -63,10 +63,8 @@ private Q_SLOTS:
     }
     void validation_data();
     void validation();
-    void add_data();
-    void add();
-    void edit_data();
-    void edit();
+    void addOrEdit_data();
+    void addOrEdit();
     void noVirtualUserSelected_data();
     void noVirtualUserSelected();
 
@@ -147,24 +145,36 @@ void TestVirtualUserDialog::validation()
     QCOMPARE(m_f.window->model()->config().virtualUserNames().size(), 2);
 }
 
-void TestVirtualUserDialog::add_data()
+// Adding a user, or editing carol; an add may follow the deletion of a
+// user.
+void TestVirtualUserDialog::addOrEdit_data()
 {
+    QTest::addColumn<bool>("editing");
     QTest::addColumn<QString>("deletedFirst");
     QTest::addColumn<QStringList>("typed");
     QTest::addColumn<QString>("message");
     QTest::addColumn<QStringList>("saved");
 
-    QTest::newRow("new user") << QString() << strings("eve", "secret", "secret") << QString()
+    const QString exists = QStringLiteral("User %1 allready exists in users database.");
+    QTest::newRow("new user") << false << QString() << strings("eve", "secret", "secret") << QString()
                               << strings("carol=c", "dave=d", "eve=secret");
-    QTest::newRow("existing name") << QString() << strings("carol", "x", "x")
-                                   << QStringLiteral("User carol allready exists in users database.")
-                                   << strings("carol=c", "dave=d");
-    QTest::newRow("deleted name again") << QStringLiteral("dave") << strings("dave", "new", "new") << QString()
+    QTest::newRow("existing name") << false << QString() << strings("carol", "x", "x")
+                                   << exists.arg(QLatin1String("carol")) << strings("carol=c", "dave=d");
+    QTest::newRow("deleted name again") << false << QStringLiteral("dave") << strings("dave", "new", "new") << QString()
                                         << strings("carol=c", "dave=new");
+    QTest::newRow("new password") << true << QString() << strings("carol", "c2", "c2") << QString()
+                                  << strings("carol=c2", "dave=d");
+    QTest::newRow("new name") << true << QString() << strings("eve", "c", "c") << QString()
+                              << strings("dave=d", "eve=c");
+    QTest::newRow("new name and password")
+        << true << QString() << strings("eve", "e", "e") << QString() << strings("dave=d", "eve=e");
+    QTest::newRow("name of another user") << true << QString() << strings("dave", "c", "c")
+                                          << exists.arg(QLatin1String("dave")) << strings("carol=c", "dave=d");
 }
 
-void TestVirtualUserDialog::add()
+void TestVirtualUserDialog::addOrEdit()
 {
+    QFETCH(bool, editing);
     QFETCH(QString, deletedFirst);
     QFETCH(QStringList, typed);
     QFETCH(QString, message);
@@ -176,62 +186,26 @@ void TestVirtualUserDialog::add()
         modal.expect(QString(), QStringLiteral("OK"));
         m_f.window->deleteUser();
     }
-    modal.expect(createTitle, fillAndAccept(typed));
-    if (!message.isNull())
-        modal.expect(message, QStringLiteral("OK"));
-    m_f.window->addUser();
-    QVERIFY2(modal.done(), qPrintable(modal.report()));
-
-    QAction *save = m_f.action("actionSave");
-    QCOMPARE(save->isEnabled(), message.isNull());
-    if (message.isNull()) {
-        QCOMPARE(m_f.window->model()->userName(m_f.window->proxy()->mapToSource(m_f.window->view()->currentIndex())),
-                 typed.at(0));
-        save->trigger();
-    }
-    QCOMPARE(database(), saved);
-}
-
-void TestVirtualUserDialog::edit_data()
-{
-    QTest::addColumn<QStringList>("typed");
-    QTest::addColumn<QString>("message");
-    QTest::addColumn<QStringList>("saved");
-
-    QTest::newRow("new password") << strings("carol", "c2", "c2") << QString() << strings("carol=c2", "dave=d");
-    QTest::newRow("new name") << strings("eve", "c", "c") << QString() << strings("dave=d", "eve=c");
-    QTest::newRow("new name and password") << strings("eve", "e", "e") << QString() << strings("dave=d", "eve=e");
-    QTest::newRow("name of another user")
-        << strings("dave", "c", "c") << QStringLiteral("User dave allready exists in users database.")
-        << strings("carol=c", "dave=d");
-}
-
-void TestVirtualUserDialog::edit()
-{
-    QFETCH(QStringList, typed);
-    QFETCH(QString, message);
-    QFETCH(QStringList, saved);
-
     QVERIFY(m_f.select(QStringLiteral("carol")));
     QStringList shown;
-    ModalHelper modal;
-    modal.expect(editTitle, [&](QWidget *widget) {
+    modal.expect(editing ? editTitle : createTitle, [&](QWidget *widget) {
         shown = fields(qobject_cast<CreateVUserDialog *>(widget));
         fillAndAccept(typed)(widget);
     });
     if (!message.isNull())
         modal.expect(message, QStringLiteral("OK"));
-    m_f.window->editUser();
+    editing ? m_f.window->editUser() : m_f.window->addUser();
     QVERIFY2(modal.done(), qPrintable(modal.report()));
 
-    QCOMPARE(shown, (strings("carol", "c", "c")));
-    TreeModel *model = m_f.window->model();
-    const bool renamed = message.isNull() && typed.at(0) != QLatin1String("carol");
-    QCOMPARE(model->indexOfUser(QStringLiteral("carol")).isValid(), !renamed);
-    QVERIFY(model->indexOfUser(typed.at(0)).isValid());
-    QAction *save = m_f.action("actionSave");
-    QCOMPARE(save->isEnabled(), message.isNull());
-    save->trigger();
+    QCOMPARE(shown, editing ? strings("carol", "c", "c") : strings("", "", ""));
+    const bool renamed = editing && message.isNull() && typed.at(0) != QLatin1String("carol");
+    QCOMPARE(m_f.source(QStringLiteral("carol")).isValid(), !renamed);
+    QVERIFY(m_f.source(typed.at(0)).isValid());
+    if (!editing && message.isNull())
+        QCOMPARE(m_f.window->model()->userName(m_f.window->proxy()->mapToSource(m_f.window->view()->currentIndex())),
+                 typed.at(0));
+    QCOMPARE(m_f.action("actionSave")->isEnabled(), message.isNull());
+    m_f.action("actionSave")->trigger();
     QCOMPARE(database(), saved);
 }
 
