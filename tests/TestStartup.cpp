@@ -41,6 +41,18 @@ bool leaveStaleSocket(const QString &path)
     return bound && QFileInfo(path).exists();
 }
 
+// The termination signal, then the kill signal to one that does not end;
+// false when it had to be killed.
+bool terminate(QProcess &process)
+{
+    process.terminate();
+    if (process.waitForFinished(15000))
+        return true;
+    process.kill();
+    process.waitForFinished(5000);
+    return false;
+}
+
 } // namespace
 
 class TestStartup : public QObject
@@ -59,11 +71,14 @@ private Q_SLOTS:
     void nonRootAlone();
 
 private:
-    int activations() const;
+    int activations() const
+    {
+        return m_firstErr.count(activated);
+    }
     QStringList asNobody(const QStringList &command) const;
     void startFirst();
 
-    QTemporaryDir m_config;
+    TemporaryRoot m_config;
     QTemporaryDir m_nobodyRuntime;
     FixtureRoot m_root;
     QString m_serverName;
@@ -77,18 +92,13 @@ void TestStartup::initTestCase()
     if (::getuid() != 0)
         QSKIP("starts the program as root and as nobody: run as root");
     QVERIFY(QFileInfo(program).isExecutable());
-    QVERIFY(m_config.isValid());
     // Qt would otherwise make and leave /tmp/runtime-nobody.
     QVERIFY(m_nobodyRuntime.isValid());
     QVERIFY(::chown(QFile::encodeName(m_nobodyRuntime.path()).constData(), 65534, 65534) == 0);
     QVERIFY(m_root.write());
     // Started processes keep their settings here; the PAM question is
     // answered for good, so that the window comes up without a dialog.
-    QFile settings(m_config.filePath(QStringLiteral("ftpconfig/ftpconfig.conf")));
-    QVERIFY(QDir().mkpath(QFileInfo(settings).path()));
-    QVERIFY(settings.open(QIODevice::WriteOnly));
-    settings.write("[General]\nskip_pam_check=true\n");
-    settings.close();
+    QVERIFY(m_config.writeFile(QStringLiteral("/ftpconfig/ftpconfig.conf"), "[General]\nskip_pam_check=true\n"));
     qputenv("XDG_CONFIG_HOME", QFile::encodeName(m_config.path()));
     qputenv("QT_LOGGING_RULES", "ftpconfig.*.debug=true");
 
@@ -118,12 +128,7 @@ void TestStartup::cleanupTestCase()
         return;
     // The termination signal ends the event loop: the ordinary exit, with
     // the loop's status and the socket removed.
-    m_first.terminate();
-    const bool finished = m_first.waitForFinished(15000);
-    if (!finished) {
-        m_first.kill();
-        m_first.waitForFinished(5000);
-    }
+    const bool finished = terminate(m_first);
     m_firstErr += m_first.readAllStandardError();
     QVERIFY2(finished && m_first.exitStatus() == QProcess::NormalExit, m_firstErr.constData());
     QCOMPARE(m_first.exitCode(), 0);
@@ -143,11 +148,6 @@ QStringList TestStartup::asNobody(const QStringList &command) const
                        QStringLiteral("--clear-groups"), QStringLiteral("env"),
                        QStringLiteral("XDG_RUNTIME_DIR=") + m_nobodyRuntime.path()}
     + command;
-}
-
-int TestStartup::activations() const
-{
-    return m_firstErr.count(activated);
 }
 
 void TestStartup::refusalBox()
@@ -242,12 +242,7 @@ void TestStartup::nonRootAlone()
     QTRY_VERIFY_WITH_TIMEOUT(err.contains(refusing) || nonRoot.state() != QProcess::Running, 30000);
     QTest::qWait(300);
     const bool blocked = nonRoot.state() == QProcess::Running;
-    nonRoot.terminate();
-    const bool finished = nonRoot.waitForFinished(10000);
-    if (!finished) {
-        nonRoot.kill();
-        nonRoot.waitForFinished(5000);
-    }
+    const bool finished = terminate(nonRoot);
     err += nonRoot.readAllStandardError();
     QVERIFY2(blocked, err.constData());
     QVERIFY(finished);
