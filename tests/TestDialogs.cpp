@@ -1,6 +1,7 @@
 #include "ModalHelper.h"
 #include "TemporaryRoot.h"
 #include "TestMain.h"
+#include "TestStrings.h"
 #include "dialogs/FileInputDialog.h"
 #include "dialogs/GuiInteraction.h"
 #include "dialogs/PAMDialog.h"
@@ -58,7 +59,6 @@ private Q_SLOTS:
     void exitProcess();
     void messages_data();
     void messages();
-    void failureDialog();
     void pamDialogText();
     void pamDialog_data();
     void pamDialog();
@@ -125,33 +125,29 @@ void TestDialogs::messages_data()
     QTest::addColumn<int>("answer");
 
     using Icon = Interaction::Icon;
-    const QString ok = QStringLiteral("OK");
-    const QString yes = QStringLiteral("Yes");
-    const QString no = QStringLiteral("No");
-    const QString create = QStringLiteral("Create");
-    const QString cancel = QStringLiteral("Cancel");
     const QString t = QStringLiteral("Title");
     const QString x = QStringLiteral("Text");
     const QString i = QStringLiteral("Informative");
     const QString d = QStringLiteral("Detailed\nlines");
-    QTest::newRow("information") << question(Icon::Information, t, x, {}, {}) << ok << int(QMessageBox::Information)
-                                 << QStringList{ok} << QString() << -1;
-    QTest::newRow("warning") << question(Icon::Warning, {}, x, i, {}) << ok << int(QMessageBox::Warning)
-                             << QStringList{ok} << QString() << -1;
-    QTest::newRow("critical") << question(Icon::Critical, t, x, i, d) << ok << int(QMessageBox::Critical)
-                              << QStringList{ok} << QString() << -1;
-    const auto createQuestion = question(Icon::Question, {}, x, i, {}, {Button::Accept, Button::Cancel}, create);
-    QTest::newRow("create") << createQuestion << create << int(QMessageBox::Question) << QStringList{create, cancel}
+    QTest::newRow("information") << question(Icon::Information, t, x, {}, {}) << "OK" << int(QMessageBox::Information)
+                                 << strings("OK") << QString() << -1;
+    QTest::newRow("warning") << question(Icon::Warning, {}, x, i, {}) << "OK" << int(QMessageBox::Warning)
+                             << strings("OK") << QString() << -1;
+    QTest::newRow("critical") << question(Icon::Critical, t, x, i, d) << "OK" << int(QMessageBox::Critical)
+                              << strings("OK") << QString() << -1;
+    const auto create
+        = question(Icon::Question, {}, x, i, {}, {Button::Accept, Button::Cancel}, QStringLiteral("Create"));
+    QTest::newRow("create") << create << "Create" << int(QMessageBox::Question) << strings("Create", "Cancel")
                             << QString() << int(Button::Accept);
-    QTest::newRow("create cancelled") << createQuestion << cancel << int(QMessageBox::Question)
-                                      << QStringList{create, cancel} << QString() << int(Button::Cancel);
+    QTest::newRow("create cancelled") << create << "Cancel" << int(QMessageBox::Question) << strings("Create", "Cancel")
+                                      << QString() << int(Button::Cancel);
     const auto yesNo = question(Icon::Question, t, x, {}, d, {Button::Yes, Button::No}, {}, Button::Yes);
     QTest::newRow("default yes, answered no")
-        << yesNo << no << int(QMessageBox::Question) << QStringList{yes, no} << yes << int(Button::No);
-    QTest::newRow("closed is no") << yesNo << QString() << int(QMessageBox::Question) << QStringList{yes, no} << yes
+        << yesNo << "No" << int(QMessageBox::Question) << strings("Yes", "No") << "Yes" << int(Button::No);
+    QTest::newRow("closed is no") << yesNo << QString() << int(QMessageBox::Question) << strings("Yes", "No") << "Yes"
                                   << int(Button::No);
-    QTest::newRow("warning question") << question(Icon::Warning, {}, x, i, {}, {Button::Yes, Button::No}) << yes
-                                      << int(QMessageBox::Warning) << QStringList{yes, no} << QString()
+    QTest::newRow("warning question") << question(Icon::Warning, {}, x, i, {}, {Button::Yes, Button::No}) << "Yes"
+                                      << int(QMessageBox::Warning) << strings("Yes", "No") << QString()
                                       << int(Button::Yes);
 }
 
@@ -187,20 +183,6 @@ void TestDialogs::messages()
     QCOMPARE(seen.buttons, buttons);
     if (!defaultButton.isEmpty())
         QCOMPARE(seen.defaultButton, defaultButton);
-}
-
-void TestDialogs::failureDialog()
-{
-    const AccessFailure failure{
-        FailureKind::Filesystem,
-        QStringLiteral("***Result: FALSE. Check: user home directory /srv/ftp does not exist.")};
-    ModalHelper modal;
-    modal.expect(failure.message, QDialogButtonBox::Ok);
-    GuiInteraction gui;
-    showFailureDialog(gui, failure);
-    QVERIFY2(modal.done(), qPrintable(modal.report()));
-    QCOMPARE(modal.seen().first().informativeText, QStringLiteral("Failure classification: filesystem permissions"));
-    QCOMPARE(modal.seen().first().icon, QMessageBox::Critical);
 }
 
 void TestDialogs::pamDialogText()

@@ -286,7 +286,10 @@ void TestFtpServerConfig::failureDialog()
 {
     ScriptedInteraction interaction;
     showFailureDialog(interaction, {FailureKind::UserlistFile, QStringLiteral("why")});
-    QCOMPARE(interaction.texts(), QStringList{QStringLiteral("|why|Failure classification: FTP userlist file")});
+    showFailureDialog(interaction, {FailureKind::Filesystem, QStringLiteral("where")});
+    QCOMPARE(interaction.texts(),
+             (QStringList{QStringLiteral("|why|Failure classification: FTP userlist file"),
+                          QStringLiteral("|where|Failure classification: filesystem permissions")}));
     QCOMPARE(interaction.records.constFirst().message.icon, Interaction::Icon::Critical);
 }
 
