@@ -45,24 +45,200 @@ private Q_SLOTS:
         vexInit("1.2.13", "Program to control FTP server VSFTPD");
         QVERIFY(m_f.setUp());
     }
+
     void init()
     {
         QVERIFY(m_f.open());
     }
+
     void cleanup()
     {
         QCOMPARE(m_f.close(), QString());
     }
-    void firstRun();
-    void unsavedChanges_data();
-    void unsavedChanges();
-    void filterKeepsCurrentRow_data();
-    void filterKeepsCurrentRow();
-    void userActionsFollowSelection_data();
-    void userActionsFollowSelection();
-    void deleteVirtualUser_data();
-    void deleteVirtualUser();
-    void loginCheckFollowsEdits();
+
+    void firstRun()
+    {
+        QCOMPARE(m_f.window->size(), QSize(640, 480));
+        QCOMPARE(m_f.window->findChild<QToolBar *>()->orientation(), Qt::Horizontal);
+        const QHeaderView *header = m_f.window->view()->header();
+        // QTreeView hides the hint of QAbstractItemView, which is public.
+        const QAbstractItemView *view = m_f.window->view();
+        QCOMPARE(header->count(), 5);
+        QCOMPARE(m_f.window->model()->headerData(TreeModel::ServerColumn, Qt::Horizontal).toString(),
+                 QStringLiteral("server"));
+        for (int column = 0; column < header->count(); ++column) {
+            const int contents = qMax(view->sizeHintForColumn(column), header->sectionSizeHint(column));
+            // The last column stretches over what the others leave.
+            if (column < header->count() - 1)
+                QCOMPARE(header->sectionSize(column), contents);
+            else
+                QVERIFY(header->sectionSize(column) >= contents);
+        }
+        // Nothing changed yet: no Save, no label; the service is stopped.
+        QVERIFY(!m_f.action("actionSave")->isEnabled());
+        QVERIFY(!m_f.window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
+        QCOMPARE(m_f.action("actionStartStopService")->text(), QStringLiteral("Start FTP service"));
+        // Checked from the start, yet system users stay until toggled twice.
+        QAction *hideSystem = m_f.action("hideSystemUsersAction");
+        QVERIFY(hideSystem->isChecked());
+        QVERIFY(!m_f.window->proxy()->hideSystemUsers());
+        hideSystem->trigger();
+        QVERIFY(!m_f.window->proxy()->hideSystemUsers());
+        hideSystem->trigger();
+        QVERIFY(m_f.window->proxy()->hideSystemUsers());
+    }
+
+    // bob denied, in memory until saved, then the window closed or the service
+    // started.
+    void unsavedChanges_data()
+    {
+        QTest::addColumn<bool>("closing"); // or starting the service
+        QTest::addColumn<QString>("answer");
+        QTest::addColumn<bool>("done"); // closed, or started
+        QTest::addColumn<bool>("saved");
+        QTest::newRow("close, Cancel keeps the window and writes no setting") << true << "Cancel" << false << false;
+        QTest::newRow("close, No closes unsaved and still writes the settings") << true << "No" << true << false;
+        QTest::newRow("start, Cancel: neither saved nor started") << false << "Cancel" << false << false;
+        QTest::newRow("start, No: started unsaved") << false << "No" << true << false;
+        QTest::newRow("start, Yes: saved, then started") << false << "Yes" << true << true;
+    }
+
+    void unsavedChanges()
+    {
+        QFETCH(bool, closing);
+        QFETCH(QString, answer);
+        QFETCH(bool, done);
+        QFETCH(bool, saved);
+        QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
+        QVERIFY(m_f.action("actionSave")->isEnabled());
+        QVERIFY(m_f.window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
+
+        ModalHelper modal;
+        if (closing) {
+            modal.expect(QStringLiteral("Do you want to save changes?"), answer);
+            QCOMPARE(m_f.window->close(), done);
+        } else {
+            modal.expect(QStringLiteral("You have unsaved changes. Do you want to save them before service start?"),
+                         answer);
+            // The service fails to start here, which is how a start shows.
+            if (done)
+                modal.expect(QString(), QStringLiteral("OK"));
+            m_f.action("actionStartStopService")->trigger();
+        }
+        QVERIFY2(modal.done(), qPrintable(modal.report()));
+        QCOMPARE(modal.seen().first().icon, closing ? QMessageBox::Question : QMessageBox::Warning);
+        if (closing) {
+            QCOMPARE(m_f.window->isVisible(), !done);
+            QCOMPARE(storedKeys().size(), done ? 5 : 0);
+        } else if (done) {
+            QCOMPARE(modal.seen().last().text, QStringLiteral("Failed to start vsftpd.\n") + m_f.server->lastError());
+            QCOMPARE(modal.seen().last().icon, QMessageBox::NoIcon);
+        }
+        QCOMPARE(userlist().contains(QLatin1String("bob")), saved);
+        QCOMPARE(m_f.action("actionSave")->isEnabled(), !saved);
+    }
+
+    void filterKeepsCurrentRow_data()
+    {
+        QTest::addColumn<QString>("filter");
+        QTest::addColumn<QString>("user");
+        QTest::newRow("system") << QStringLiteral("hideSystemUsersAction") << QStringLiteral("bob");
+        QTest::newRow("denied") << QStringLiteral("hideDeniedUsersAction") << QStringLiteral("bob");
+        QTest::newRow("allowed") << QStringLiteral("hideAllowedUsersAction") << QStringLiteral("root");
+    }
+
+    void filterKeepsCurrentRow()
+    {
+        QFETCH(QString, filter);
+        QFETCH(QString, user);
+        QVERIFY(m_f.select(user));
+        const int before = m_f.window->proxy()->rowCount(m_f.window->proxy()->mapFromSource(m_f.source(user).parent()));
+        QAction *toggle = m_f.action(qPrintable(filter));
+        // Hide system users starts checked but unapplied: twice applies it.
+        toggle->trigger();
+        if (!toggle->isChecked())
+            toggle->trigger();
+        const QModelIndex current = m_f.window->view()->currentIndex();
+        QCOMPARE(m_f.window->proxy()->mapToSource(current), m_f.source(user));
+        QVERIFY(m_f.window->view()->selectionModel()->isSelected(current));
+        // The filter did hide someone beside the kept row.
+        QVERIFY(m_f.window->proxy()->rowCount(current.parent()) < before);
+    }
+
+    void userActionsFollowSelection_data()
+    {
+        QTest::addColumn<QString>("row");
+        QTest::addColumn<bool>("shown");
+        QTest::newRow("group") << QStringLiteral("Virtual users") << false;
+        QTest::newRow("top row") << QStringLiteral("Everybody") << false;
+        QTest::newRow("local user") << QStringLiteral("bob") << false;
+        QTest::newRow("anonymous") << QStringLiteral("Anonymous users") << false;
+        QTest::newRow("virtual user") << QStringLiteral("carol") << true;
+    }
+
+    void userActionsFollowSelection()
+    {
+        QFETCH(QString, row);
+        QFETCH(bool, shown);
+        QVERIFY(m_f.select(QStringLiteral("dave")));
+        QVERIFY(m_f.select(row));
+        QCOMPARE(m_f.action("actionEdit_user")->isVisible(), shown);
+        QCOMPARE(m_f.action("actionDelete_user")->isVisible(), shown);
+        // The login check follows the same selection.
+        QCOMPARE(m_f.window->loginCheckDock()->userName(),
+                 m_f.window->model()->isUserRow(m_f.source(row)) ? row : QString());
+    }
+
+    void deleteVirtualUser_data()
+    {
+        QTest::addColumn<QString>("answer");
+        QTest::addColumn<bool>("removed");
+        QTest::newRow("OK removes") << "OK" << true;
+        QTest::newRow("Cancel keeps") << "Cancel" << false;
+    }
+
+    void deleteVirtualUser()
+    {
+        QFETCH(QString, answer);
+        QFETCH(bool, removed);
+        QVERIFY(m_f.select(QStringLiteral("carol")));
+        ModalHelper modal;
+        modal.expect(QStringLiteral("Are you sure you want to delete virtual user carol?"), answer);
+        m_f.window->deleteUser();
+        QVERIFY2(modal.done(), qPrintable(modal.report()));
+        QCOMPARE(modal.seen().first().icon, QMessageBox::Warning);
+        QCOMPARE(m_f.source(QStringLiteral("carol")).isValid(), !removed);
+        QVERIFY(m_f.source(QStringLiteral("dave")).isValid());
+        QCOMPARE(m_f.action("actionSave")->isEnabled(), removed);
+        if (removed)
+            QVERIFY(!m_f.action("actionDelete_user")->isVisible());
+    }
+
+    void loginCheckFollowsEdits()
+    {
+        QVERIFY(m_f.select(QStringLiteral("bob")));
+        const QTreeWidget *tree = m_f.window->loginCheckDock()->findingsTree();
+        const auto verdict = [tree] {
+            // Server first, then the user with the verdict as first child.
+            const QTreeWidgetItem *user = tree->topLevelItem(1);
+            return user && user->text(LoginCheckDock::CheckColumn) == QLatin1String("bob") && user->childCount() == 2
+                ? user->child(0)
+                : nullptr;
+        };
+        QVERIFY(verdict());
+        QCOMPARE(tree->topLevelItem(0)->text(LoginCheckDock::CheckColumn), QStringLiteral("Server"));
+        QCOMPARE(verdict()->text(LoginCheckDock::ResultColumn), QStringLiteral("allowed"));
+
+        QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
+        QTRY_VERIFY(verdict() && verdict()->text(LoginCheckDock::ResultColumn) == QLatin1String("denied"));
+        QCOMPARE(verdict()->text(LoginCheckDock::WhereColumn), QStringLiteral("FTP userlist file"));
+        QVERIFY(verdict()->text(LoginCheckDock::MessageColumn).startsWith(QLatin1String("***Result: FALSE.")));
+        // The server reads the same userlist: its forecast has a finding too.
+        const QTreeWidgetItem *forecast = tree->topLevelItem(1)->child(1);
+        QCOMPARE(forecast->text(LoginCheckDock::ResultColumn), QStringLiteral("denied"));
+        QVERIFY(forecast->childCount() > 0);
+        QVERIFY(!forecast->child(0)->text(LoginCheckDock::WhereColumn).isEmpty());
+    }
 
 private:
     QString userlist() const
@@ -72,190 +248,6 @@ private:
 
     WindowFixture m_f;
 };
-
-void TestMainWindow::firstRun()
-{
-    QCOMPARE(m_f.window->size(), QSize(640, 480));
-    QCOMPARE(m_f.window->findChild<QToolBar *>()->orientation(), Qt::Horizontal);
-    const QHeaderView *header = m_f.window->view()->header();
-    // QTreeView hides the hint of QAbstractItemView, which is public.
-    const QAbstractItemView *view = m_f.window->view();
-    QCOMPARE(header->count(), 5);
-    QCOMPARE(m_f.window->model()->headerData(TreeModel::ServerColumn, Qt::Horizontal).toString(),
-             QStringLiteral("server"));
-    for (int column = 0; column < header->count(); ++column) {
-        const int contents = qMax(view->sizeHintForColumn(column), header->sectionSizeHint(column));
-        // The last column stretches over what the others leave.
-        if (column < header->count() - 1)
-            QCOMPARE(header->sectionSize(column), contents);
-        else
-            QVERIFY(header->sectionSize(column) >= contents);
-    }
-    // Nothing changed yet: no Save, no label; the service is stopped.
-    QVERIFY(!m_f.action("actionSave")->isEnabled());
-    QVERIFY(!m_f.window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
-    QCOMPARE(m_f.action("actionStartStopService")->text(), QStringLiteral("Start FTP service"));
-    // Checked from the start, yet system users stay until toggled twice.
-    QAction *hideSystem = m_f.action("hideSystemUsersAction");
-    QVERIFY(hideSystem->isChecked());
-    QVERIFY(!m_f.window->proxy()->hideSystemUsers());
-    hideSystem->trigger();
-    QVERIFY(!m_f.window->proxy()->hideSystemUsers());
-    hideSystem->trigger();
-    QVERIFY(m_f.window->proxy()->hideSystemUsers());
-}
-
-// bob denied, in memory until saved, then the window closed or the service
-// started.
-void TestMainWindow::unsavedChanges_data()
-{
-    QTest::addColumn<bool>("closing"); // or starting the service
-    QTest::addColumn<QString>("answer");
-    QTest::addColumn<bool>("done"); // closed, or started
-    QTest::addColumn<bool>("saved");
-    QTest::newRow("close, Cancel keeps the window and writes no setting") << true << "Cancel" << false << false;
-    QTest::newRow("close, No closes unsaved and still writes the settings") << true << "No" << true << false;
-    QTest::newRow("start, Cancel: neither saved nor started") << false << "Cancel" << false << false;
-    QTest::newRow("start, No: started unsaved") << false << "No" << true << false;
-    QTest::newRow("start, Yes: saved, then started") << false << "Yes" << true << true;
-}
-
-void TestMainWindow::unsavedChanges()
-{
-    QFETCH(bool, closing);
-    QFETCH(QString, answer);
-    QFETCH(bool, done);
-    QFETCH(bool, saved);
-    QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
-    QVERIFY(m_f.action("actionSave")->isEnabled());
-    QVERIFY(m_f.window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
-
-    ModalHelper modal;
-    if (closing) {
-        modal.expect(QStringLiteral("Do you want to save changes?"), answer);
-        QCOMPARE(m_f.window->close(), done);
-    } else {
-        modal.expect(QStringLiteral("You have unsaved changes. Do you want to save them before service start?"),
-                     answer);
-        // The service fails to start here, which is how a start shows.
-        if (done)
-            modal.expect(QString(), QStringLiteral("OK"));
-        m_f.action("actionStartStopService")->trigger();
-    }
-    QVERIFY2(modal.done(), qPrintable(modal.report()));
-    QCOMPARE(modal.seen().first().icon, closing ? QMessageBox::Question : QMessageBox::Warning);
-    if (closing) {
-        QCOMPARE(m_f.window->isVisible(), !done);
-        QCOMPARE(storedKeys().size(), done ? 5 : 0);
-    } else if (done) {
-        QCOMPARE(modal.seen().last().text, QStringLiteral("Failed to start vsftpd.\n") + m_f.server->lastError());
-        QCOMPARE(modal.seen().last().icon, QMessageBox::NoIcon);
-    }
-    QCOMPARE(userlist().contains(QLatin1String("bob")), saved);
-    QCOMPARE(m_f.action("actionSave")->isEnabled(), !saved);
-}
-
-void TestMainWindow::filterKeepsCurrentRow_data()
-{
-    QTest::addColumn<QString>("filter");
-    QTest::addColumn<QString>("user");
-    QTest::newRow("system") << QStringLiteral("hideSystemUsersAction") << QStringLiteral("bob");
-    QTest::newRow("denied") << QStringLiteral("hideDeniedUsersAction") << QStringLiteral("bob");
-    QTest::newRow("allowed") << QStringLiteral("hideAllowedUsersAction") << QStringLiteral("root");
-}
-
-void TestMainWindow::filterKeepsCurrentRow()
-{
-    QFETCH(QString, filter);
-    QFETCH(QString, user);
-    QVERIFY(m_f.select(user));
-    const int before = m_f.window->proxy()->rowCount(m_f.window->proxy()->mapFromSource(m_f.source(user).parent()));
-    QAction *toggle = m_f.action(qPrintable(filter));
-    // Hide system users starts checked but unapplied: twice applies it.
-    toggle->trigger();
-    if (!toggle->isChecked())
-        toggle->trigger();
-    const QModelIndex current = m_f.window->view()->currentIndex();
-    QCOMPARE(m_f.window->proxy()->mapToSource(current), m_f.source(user));
-    QVERIFY(m_f.window->view()->selectionModel()->isSelected(current));
-    // The filter did hide someone beside the kept row.
-    QVERIFY(m_f.window->proxy()->rowCount(current.parent()) < before);
-}
-
-void TestMainWindow::userActionsFollowSelection_data()
-{
-    QTest::addColumn<QString>("row");
-    QTest::addColumn<bool>("shown");
-    QTest::newRow("group") << QStringLiteral("Virtual users") << false;
-    QTest::newRow("top row") << QStringLiteral("Everybody") << false;
-    QTest::newRow("local user") << QStringLiteral("bob") << false;
-    QTest::newRow("anonymous") << QStringLiteral("Anonymous users") << false;
-    QTest::newRow("virtual user") << QStringLiteral("carol") << true;
-}
-
-void TestMainWindow::userActionsFollowSelection()
-{
-    QFETCH(QString, row);
-    QFETCH(bool, shown);
-    QVERIFY(m_f.select(QStringLiteral("dave")));
-    QVERIFY(m_f.select(row));
-    QCOMPARE(m_f.action("actionEdit_user")->isVisible(), shown);
-    QCOMPARE(m_f.action("actionDelete_user")->isVisible(), shown);
-    // The login check follows the same selection.
-    QCOMPARE(m_f.window->loginCheckDock()->userName(),
-             m_f.window->model()->isUserRow(m_f.source(row)) ? row : QString());
-}
-
-void TestMainWindow::deleteVirtualUser_data()
-{
-    QTest::addColumn<QString>("answer");
-    QTest::addColumn<bool>("removed");
-    QTest::newRow("OK removes") << "OK" << true;
-    QTest::newRow("Cancel keeps") << "Cancel" << false;
-}
-
-void TestMainWindow::deleteVirtualUser()
-{
-    QFETCH(QString, answer);
-    QFETCH(bool, removed);
-    QVERIFY(m_f.select(QStringLiteral("carol")));
-    ModalHelper modal;
-    modal.expect(QStringLiteral("Are you sure you want to delete virtual user carol?"), answer);
-    m_f.window->deleteUser();
-    QVERIFY2(modal.done(), qPrintable(modal.report()));
-    QCOMPARE(modal.seen().first().icon, QMessageBox::Warning);
-    QCOMPARE(m_f.source(QStringLiteral("carol")).isValid(), !removed);
-    QVERIFY(m_f.source(QStringLiteral("dave")).isValid());
-    QCOMPARE(m_f.action("actionSave")->isEnabled(), removed);
-    if (removed)
-        QVERIFY(!m_f.action("actionDelete_user")->isVisible());
-}
-
-void TestMainWindow::loginCheckFollowsEdits()
-{
-    QVERIFY(m_f.select(QStringLiteral("bob")));
-    const QTreeWidget *tree = m_f.window->loginCheckDock()->findingsTree();
-    const auto verdict = [tree] {
-        // Server first, then the user with the verdict as first child.
-        const QTreeWidgetItem *user = tree->topLevelItem(1);
-        return user && user->text(LoginCheckDock::CheckColumn) == QLatin1String("bob") && user->childCount() == 2
-            ? user->child(0)
-            : nullptr;
-    };
-    QVERIFY(verdict());
-    QCOMPARE(tree->topLevelItem(0)->text(LoginCheckDock::CheckColumn), QStringLiteral("Server"));
-    QCOMPARE(verdict()->text(LoginCheckDock::ResultColumn), QStringLiteral("allowed"));
-
-    QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
-    QTRY_VERIFY(verdict() && verdict()->text(LoginCheckDock::ResultColumn) == QLatin1String("denied"));
-    QCOMPARE(verdict()->text(LoginCheckDock::WhereColumn), QStringLiteral("FTP userlist file"));
-    QVERIFY(verdict()->text(LoginCheckDock::MessageColumn).startsWith(QLatin1String("***Result: FALSE.")));
-    // The server reads the same userlist: its forecast has a finding too.
-    const QTreeWidgetItem *forecast = tree->topLevelItem(1)->child(1);
-    QCOMPARE(forecast->text(LoginCheckDock::ResultColumn), QStringLiteral("denied"));
-    QVERIFY(forecast->childCount() > 0);
-    QVERIFY(!forecast->child(0)->text(LoginCheckDock::WhereColumn).isEmpty());
-}
 
 FTPCONFIG_TEST_MAIN(TestMainWindow)
 #include "TestMainWindow.moc"

@@ -96,214 +96,207 @@ class TestTreeModel : public QObject
     Q_OBJECT
 
 private slots:
-    void tree();
-    void users_data();
-    void users();
-    void edits_data();
-    void edits();
-    void saveWritesAndClears();
-    void filters_data();
-    void filters();
+    void tree()
+    {
+        Table table;
+        QVERIFY(table.load());
+        const TreeModel &model = *table.model;
+        QCOMPARE(childNames(model, {}), strings("Everybody"));
+        const QModelIndex everybody = model.index(0, 0);
+        QCOMPARE(childNames(model, everybody), (strings("Local users", "Virtual users", "Anonymous users")));
+        QCOMPARE(childNames(model, model.index(0, 0, everybody)), localUsers);
+        QCOMPARE(childNames(model, model.index(1, 0, everybody)), (strings("vic", "wendy")));
+        QCOMPARE(model.columnCount(), 5);
+        QCOMPARE(model.headerData(4, Qt::Horizontal).toString(), QStringLiteral("server"));
+        // Group rows have a name and the arrow, nothing else, and edit nothing.
+        for (const QModelIndex &group : {everybody, model.index(0, 0, everybody), model.index(1, 0, everybody)}) {
+            QVERIFY(sameIcon(group.data(Qt::DecorationRole), ":/prefix/icons/arrow_right.png"));
+            QCOMPARE(group.siblingAtColumn(1).data().toString(), QString());
+            QVERIFY(!(model.flags(group.siblingAtColumn(1)) & Qt::ItemIsEditable));
+        }
+        QVERIFY(model.isInVirtualGroup(table.user(QStringLiteral("vic"))));
+        QVERIFY(!model.isInVirtualGroup(table.user(QStringLiteral("bob"))));
+        QVERIFY(model.flags(table.user(QStringLiteral("bob"), TreeModel::StatusColumn)) & Qt::ItemIsEditable);
+        QVERIFY(!(model.flags(table.user(QStringLiteral("bob"), TreeModel::ServerColumn)) & Qt::ItemIsEditable));
+        QVERIFY(!table.model->hasUnsavedChanges());
+        QCOMPARE(table.interaction.records.size(), 0);
+    }
+
+    void users_data()
+    {
+        QTest::addColumn<QString>("name");
+        QTest::addColumn<QString>("status");
+        QTest::addColumn<int>("kind");
+        QTest::addColumn<QString>("directory");
+        QTest::addColumn<QString>("server");
+
+        QTest::newRow("plain local user") << "bob"
+                                          << "allowed" << 0 << "/home/bob"
+                                          << "allowed";
+        QTest::newRow("listed in ftpusers") << "root"
+                                            << "denied" << 1 << "/root"
+                                            << "denied";
+        QTest::newRow("locked in shadow") << "locked"
+                                          << "denied" << 5 << "/home/locked"
+                                          << "denied";
+        QTest::newRow("virtual without guest mode") << "vic"
+                                                    << "denied" << 3 << ""
+                                                    << "denied";
+        QTest::newRow("anonymous row") << "Anonymous users"
+                                       << "allowed" << 0 << "/srv/ftp"
+                                       << "allowed";
+    }
+
+    void users()
+    {
+        QFETCH(QString, name);
+        QFETCH(QString, status);
+        QFETCH(int, kind);
+        QFETCH(QString, directory);
+        QFETCH(QString, server);
+
+        Table table;
+        QVERIFY(
+            table.load({{QStringLiteral("/etc/vsftpd.conf"), "listen=YES\nlocal_enable=YES\nanonymous_enable=YES\n"}}));
+        QCOMPARE(table.cell(name, TreeModel::StatusColumn), status);
+        QCOMPARE(table.model->failure(table.user(name))->kind, static_cast<FailureKind>(kind));
+        QVERIFY(sameIcon(table.user(name).data(Qt::DecorationRole),
+                         status == QLatin1String("allowed") ? ":/prefix/icons/user_green.png"
+                                                            : ":/prefix/icons/user_red.png"));
+        QCOMPARE(table.cell(name, TreeModel::DirectoryColumn), directory);
+        QVERIFY(!table.cell(name, TreeModel::ModeColumn).isEmpty());
+        QVERIFY2(table.cell(name, TreeModel::ServerColumn) == server,
+                 qPrintable(table.user(name, TreeModel::ServerColumn).data(Qt::ToolTipRole).toString()));
+        // The tool tips explain: the verdict's kind and message, the server's
+        // first finding.
+        const QString statusTip = table.user(name, TreeModel::StatusColumn).data(Qt::ToolTipRole).toString();
+        if (kind != 0)
+            QVERIFY2(statusTip.contains(table.model->failure(table.user(name))->message), qPrintable(statusTip));
+        const auto forecast = table.model->forecast(table.user(name));
+        QVERIFY(forecast.has_value());
+        if (!forecast->findings.isEmpty()) {
+            const QString serverTip = table.user(name, TreeModel::ServerColumn).data(Qt::ToolTipRole).toString();
+            QVERIFY2(serverTip.contains(forecast->findings.first().message), qPrintable(serverTip));
+        }
+    }
+
+    void edits_data()
+    {
+        QTest::addColumn<QString>("name");
+        QTest::addColumn<int>("column");
+        QTest::addColumn<QString>("value");
+        QTest::addColumn<QString>("expected"); // the cell afterwards
+        QTest::addColumn<QStringList>("texts"); // what the operator was told
+        QTest::addColumn<bool>("unsaved");
+
+        const QString refused = QStringLiteral("|Unable to change access status.|Failed check type: ");
+        QTest::newRow("allow a user the userlist blocks") << "alice" << 1 << "allowed"
+                                                          << "allowed" << QStringList() << true;
+        QTest::newRow("deny through the userlist") << "bob" << 1 << "denied"
+                                                   << "denied" << QStringList() << true;
+        QTest::newRow("allow root: ftpusers repaired, shadow refuses")
+            << "root" << 1 << "allowed"
+            << "denied"
+            << QStringList{refused
+                           + QLatin1String("/etc/passwd or /etc/shadow|***Result: FALSE. Check: user root  has bad "
+                                           "passwd in /etc/shadow (* or !).")}
+            << false;
+        QTest::newRow("allow a virtual user: guest mode") << "vic" << 1 << "allowed"
+                                                          << "allowed" << QStringList() << true;
+        QTest::newRow("anonymous off") << "Anonymous users" << 1 << "denied"
+                                       << "denied" << QStringList() << true;
+        QTest::newRow("no such status") << "bob" << 1 << "maybe"
+                                        << "allowed"
+                                        << strings("|Unable to set data. Data is invalid. Reason is unknown") << false;
+        QTest::newRow("rename a local user")
+            << "bob" << 0 << "robert"
+            << "bob" << strings("|You can change only virtual user names. Skipping change bob to robert") << false;
+        QTest::newRow("rename a virtual user to a bad name")
+            << "vic" << 0 << ".hidden"
+            << "vic" << strings("|Unable to set data. Data is invalid.||the name begins with \".\"") << false;
+        QTest::newRow("rights") << "bob" << 3 << "download, upload"
+                                << "download, upload" << QStringList() << true;
+    }
+
+    void edits()
+    {
+        QFETCH(QString, name);
+        QFETCH(int, column);
+        QFETCH(QString, value);
+        QFETCH(QString, expected);
+        QFETCH(QStringList, texts);
+        QFETCH(bool, unsaved);
+
+        Table table;
+        QVERIFY(table.load({{QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf"), "alice\n"}}));
+        QSignalSpy changed(table.model.get(), &QAbstractItemModel::dataChanged);
+        CaptureStream out(std::cout);
+        QCOMPARE(table.model->setData(table.user(name, column), value), unsaved);
+        QCOMPARE(table.cell(name, column), expected);
+        QCOMPARE(table.interaction.texts(), texts);
+        QCOMPARE(table.interaction.unexpected, 0);
+        QCOMPARE(table.model->hasUnsavedChanges(), unsaved);
+        QCOMPARE(changed.isEmpty(), !unsaved);
+    }
+
+    void saveWritesAndClears()
+    {
+        Table table;
+        QVERIFY(table.load());
+        CaptureStream out(std::cout);
+        QVERIFY(
+            table.model->setData(table.user(QStringLiteral("bob"), TreeModel::StatusColumn), QStringLiteral("denied")));
+        // A virtual user renamed in memory is written under the new name.
+        QVERIFY(table.model->setData(table.user(QStringLiteral("vic")), QStringLiteral("victor")));
+        QVERIFY(table.user(QStringLiteral("victor")).isValid());
+        QVERIFY(table.model->hasUnsavedChanges());
+        table.model->onSave();
+        QVERIFY(!table.model->hasUnsavedChanges());
+        QCOMPARE(table.root.readFile(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")), QByteArray("bob\n"));
+        QVERIFY(table.root.readFile(QStringLiteral("/etc/vsftpd.conf")).contains("userlist_enable=yes"));
+        QVERIFY(table.reload());
+        QVERIFY(table.user(QStringLiteral("victor")).isValid());
+        QVERIFY(!table.user(QStringLiteral("vic")).isValid());
+        QCOMPARE(table.cell(QStringLiteral("bob"), TreeModel::StatusColumn), QStringLiteral("denied"));
+    }
+
+    void filters_data()
+    {
+        QTest::addColumn<bool>("system");
+        QTest::addColumn<bool>("denied");
+        QTest::addColumn<bool>("allowed");
+        QTest::addColumn<QStringList>("local");
+
+        QTest::newRow("nothing hidden") << false << false << false << localUsers;
+        QTest::newRow("system users") << true << false << false
+                                      << strings("alice", "bob", "doublebang", "locked", "lockedhash", "starred");
+        QTest::newRow("denied") << false << true << false
+                                << strings("alice", "bob", "doublebang", "ftp", "lockedhash", "nobody");
+        QTest::newRow("allowed") << false << false << true << strings("locked", "root", "starred");
+        QTest::newRow("allowed and denied") << false << true << true << QStringList();
+    }
+
+    void filters()
+    {
+        QFETCH(bool, system);
+        QFETCH(bool, denied);
+        QFETCH(bool, allowed);
+        QFETCH(QStringList, local);
+
+        Table table;
+        QVERIFY(table.load());
+        CUsersFilterProxyModel proxy(&table.model->config());
+        QAbstractItemModelTester tester(&proxy, QAbstractItemModelTester::FailureReportingMode::QtTest);
+        proxy.setSourceModel(table.model.get());
+        proxy.setHideSystemUsers(system);
+        proxy.setHideDeniedUsers(denied);
+        proxy.setHideAllowedUsers(allowed);
+        const QModelIndex everybody = proxy.index(0, 0);
+        // Group rows are never hidden.
+        QCOMPARE(childNames(proxy, everybody).mid(0, 2), (strings("Local users", "Virtual users")));
+        QCOMPARE(childNames(proxy, proxy.index(0, 0, everybody)), local);
+    }
 };
-
-void TestTreeModel::tree()
-{
-    Table table;
-    QVERIFY(table.load());
-    const TreeModel &model = *table.model;
-    QCOMPARE(childNames(model, {}), strings("Everybody"));
-    const QModelIndex everybody = model.index(0, 0);
-    QCOMPARE(childNames(model, everybody), (strings("Local users", "Virtual users", "Anonymous users")));
-    QCOMPARE(childNames(model, model.index(0, 0, everybody)), localUsers);
-    QCOMPARE(childNames(model, model.index(1, 0, everybody)), (strings("vic", "wendy")));
-    QCOMPARE(model.columnCount(), 5);
-    QCOMPARE(model.headerData(4, Qt::Horizontal).toString(), QStringLiteral("server"));
-    // Group rows have a name and the arrow, nothing else, and edit nothing.
-    for (const QModelIndex &group : {everybody, model.index(0, 0, everybody), model.index(1, 0, everybody)}) {
-        QVERIFY(sameIcon(group.data(Qt::DecorationRole), ":/prefix/icons/arrow_right.png"));
-        QCOMPARE(group.siblingAtColumn(1).data().toString(), QString());
-        QVERIFY(!(model.flags(group.siblingAtColumn(1)) & Qt::ItemIsEditable));
-    }
-    QVERIFY(model.isInVirtualGroup(table.user(QStringLiteral("vic"))));
-    QVERIFY(!model.isInVirtualGroup(table.user(QStringLiteral("bob"))));
-    QVERIFY(model.flags(table.user(QStringLiteral("bob"), TreeModel::StatusColumn)) & Qt::ItemIsEditable);
-    QVERIFY(!(model.flags(table.user(QStringLiteral("bob"), TreeModel::ServerColumn)) & Qt::ItemIsEditable));
-    QVERIFY(!table.model->hasUnsavedChanges());
-    QCOMPARE(table.interaction.records.size(), 0);
-}
-
-void TestTreeModel::users_data()
-{
-    QTest::addColumn<QString>("name");
-    QTest::addColumn<QString>("status");
-    QTest::addColumn<int>("kind");
-    QTest::addColumn<QString>("directory");
-    QTest::addColumn<QString>("server");
-
-    QTest::newRow("plain local user") << "bob"
-                                      << "allowed" << 0 << "/home/bob"
-                                      << "allowed";
-    QTest::newRow("listed in ftpusers") << "root"
-                                        << "denied" << 1 << "/root"
-                                        << "denied";
-    QTest::newRow("locked in shadow") << "locked"
-                                      << "denied" << 5 << "/home/locked"
-                                      << "denied";
-    QTest::newRow("virtual without guest mode") << "vic"
-                                                << "denied" << 3 << ""
-                                                << "denied";
-    QTest::newRow("anonymous row") << "Anonymous users"
-                                   << "allowed" << 0 << "/srv/ftp"
-                                   << "allowed";
-}
-
-void TestTreeModel::users()
-{
-    QFETCH(QString, name);
-    QFETCH(QString, status);
-    QFETCH(int, kind);
-    QFETCH(QString, directory);
-    QFETCH(QString, server);
-
-    Table table;
-    QVERIFY(table.load({{QStringLiteral("/etc/vsftpd.conf"), "listen=YES\nlocal_enable=YES\nanonymous_enable=YES\n"}}));
-    QCOMPARE(table.cell(name, TreeModel::StatusColumn), status);
-    QCOMPARE(table.model->failure(table.user(name))->kind, static_cast<FailureKind>(kind));
-    QVERIFY(
-        sameIcon(table.user(name).data(Qt::DecorationRole),
-                 status == QLatin1String("allowed") ? ":/prefix/icons/user_green.png" : ":/prefix/icons/user_red.png"));
-    QCOMPARE(table.cell(name, TreeModel::DirectoryColumn), directory);
-    QVERIFY(!table.cell(name, TreeModel::ModeColumn).isEmpty());
-    QVERIFY2(table.cell(name, TreeModel::ServerColumn) == server,
-             qPrintable(table.user(name, TreeModel::ServerColumn).data(Qt::ToolTipRole).toString()));
-    // The tool tips explain: the verdict's kind and message, the server's
-    // first finding.
-    const QString statusTip = table.user(name, TreeModel::StatusColumn).data(Qt::ToolTipRole).toString();
-    if (kind != 0)
-        QVERIFY2(statusTip.contains(table.model->failure(table.user(name))->message), qPrintable(statusTip));
-    const auto forecast = table.model->forecast(table.user(name));
-    QVERIFY(forecast.has_value());
-    if (!forecast->findings.isEmpty()) {
-        const QString serverTip = table.user(name, TreeModel::ServerColumn).data(Qt::ToolTipRole).toString();
-        QVERIFY2(serverTip.contains(forecast->findings.first().message), qPrintable(serverTip));
-    }
-}
-
-void TestTreeModel::edits_data()
-{
-    QTest::addColumn<QString>("name");
-    QTest::addColumn<int>("column");
-    QTest::addColumn<QString>("value");
-    QTest::addColumn<QString>("expected"); // the cell afterwards
-    QTest::addColumn<QStringList>("texts"); // what the operator was told
-    QTest::addColumn<bool>("unsaved");
-
-    const QString refused = QStringLiteral("|Unable to change access status.|Failed check type: ");
-    QTest::newRow("allow a user the userlist blocks") << "alice" << 1 << "allowed"
-                                                      << "allowed" << QStringList() << true;
-    QTest::newRow("deny through the userlist") << "bob" << 1 << "denied"
-                                               << "denied" << QStringList() << true;
-    QTest::newRow("allow root: ftpusers repaired, shadow refuses")
-        << "root" << 1 << "allowed"
-        << "denied"
-        << QStringList{refused
-                       + QLatin1String("/etc/passwd or /etc/shadow|***Result: FALSE. Check: user root  has bad "
-                                       "passwd in /etc/shadow (* or !).")}
-        << false;
-    QTest::newRow("allow a virtual user: guest mode") << "vic" << 1 << "allowed"
-                                                      << "allowed" << QStringList() << true;
-    QTest::newRow("anonymous off") << "Anonymous users" << 1 << "denied"
-                                   << "denied" << QStringList() << true;
-    QTest::newRow("no such status") << "bob" << 1 << "maybe"
-                                    << "allowed" << strings("|Unable to set data. Data is invalid. Reason is unknown")
-                                    << false;
-    QTest::newRow("rename a local user")
-        << "bob" << 0 << "robert"
-        << "bob" << strings("|You can change only virtual user names. Skipping change bob to robert") << false;
-    QTest::newRow("rename a virtual user to a bad name")
-        << "vic" << 0 << ".hidden"
-        << "vic" << strings("|Unable to set data. Data is invalid.||the name begins with \".\"") << false;
-    QTest::newRow("rights") << "bob" << 3 << "download, upload"
-                            << "download, upload" << QStringList() << true;
-}
-
-void TestTreeModel::edits()
-{
-    QFETCH(QString, name);
-    QFETCH(int, column);
-    QFETCH(QString, value);
-    QFETCH(QString, expected);
-    QFETCH(QStringList, texts);
-    QFETCH(bool, unsaved);
-
-    Table table;
-    QVERIFY(table.load({{QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf"), "alice\n"}}));
-    QSignalSpy changed(table.model.get(), &QAbstractItemModel::dataChanged);
-    CaptureStream out(std::cout);
-    QCOMPARE(table.model->setData(table.user(name, column), value), unsaved);
-    QCOMPARE(table.cell(name, column), expected);
-    QCOMPARE(table.interaction.texts(), texts);
-    QCOMPARE(table.interaction.unexpected, 0);
-    QCOMPARE(table.model->hasUnsavedChanges(), unsaved);
-    QCOMPARE(changed.isEmpty(), !unsaved);
-}
-
-void TestTreeModel::saveWritesAndClears()
-{
-    Table table;
-    QVERIFY(table.load());
-    CaptureStream out(std::cout);
-    QVERIFY(table.model->setData(table.user(QStringLiteral("bob"), TreeModel::StatusColumn), QStringLiteral("denied")));
-    // A virtual user renamed in memory is written under the new name.
-    QVERIFY(table.model->setData(table.user(QStringLiteral("vic")), QStringLiteral("victor")));
-    QVERIFY(table.user(QStringLiteral("victor")).isValid());
-    QVERIFY(table.model->hasUnsavedChanges());
-    table.model->onSave();
-    QVERIFY(!table.model->hasUnsavedChanges());
-    QCOMPARE(table.root.readFile(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")), QByteArray("bob\n"));
-    QVERIFY(table.root.readFile(QStringLiteral("/etc/vsftpd.conf")).contains("userlist_enable=yes"));
-    QVERIFY(table.reload());
-    QVERIFY(table.user(QStringLiteral("victor")).isValid());
-    QVERIFY(!table.user(QStringLiteral("vic")).isValid());
-    QCOMPARE(table.cell(QStringLiteral("bob"), TreeModel::StatusColumn), QStringLiteral("denied"));
-}
-
-void TestTreeModel::filters_data()
-{
-    QTest::addColumn<bool>("system");
-    QTest::addColumn<bool>("denied");
-    QTest::addColumn<bool>("allowed");
-    QTest::addColumn<QStringList>("local");
-
-    QTest::newRow("nothing hidden") << false << false << false << localUsers;
-    QTest::newRow("system users") << true << false << false
-                                  << strings("alice", "bob", "doublebang", "locked", "lockedhash", "starred");
-    QTest::newRow("denied") << false << true << false
-                            << strings("alice", "bob", "doublebang", "ftp", "lockedhash", "nobody");
-    QTest::newRow("allowed") << false << false << true << strings("locked", "root", "starred");
-    QTest::newRow("allowed and denied") << false << true << true << QStringList();
-}
-
-void TestTreeModel::filters()
-{
-    QFETCH(bool, system);
-    QFETCH(bool, denied);
-    QFETCH(bool, allowed);
-    QFETCH(QStringList, local);
-
-    Table table;
-    QVERIFY(table.load());
-    CUsersFilterProxyModel proxy(&table.model->config());
-    QAbstractItemModelTester tester(&proxy, QAbstractItemModelTester::FailureReportingMode::QtTest);
-    proxy.setSourceModel(table.model.get());
-    proxy.setHideSystemUsers(system);
-    proxy.setHideDeniedUsers(denied);
-    proxy.setHideAllowedUsers(allowed);
-    const QModelIndex everybody = proxy.index(0, 0);
-    // Group rows are never hidden.
-    QCOMPARE(childNames(proxy, everybody).mid(0, 2), (strings("Local users", "Virtual users")));
-    QCOMPARE(childNames(proxy, proxy.index(0, 0, everybody)), local);
-}
 
 FTPCONFIG_TEST_MAIN(TestTreeModel)
 #include "TestTreeModel.moc"
