@@ -177,27 +177,19 @@ private Q_SLOTS:
         auto *browser = dialog.findChild<QTextBrowser *>();
         QVERIFY(browser && browser->isReadOnly());
 
-        const QStringList expected{
-            QStringLiteral(
-                "Your vsftpd PAM configuration seems to be invalid. In order to allow the virtual user "
-                "mechanism function properly, PAM vsftpd config file must contain something like these lines:"),
-            {},
-            QStringLiteral("auth    sufficient  /lib/security/pam_userdb.so db=/var/lib/ftpconfig/virtual_user_db"),
-            QStringLiteral("account sufficient  /lib/security/pam_userdb.so db=/var/lib/ftpconfig/virtual_user_db"),
-            {},
-            QStringLiteral("Note: these lines must be BEFORE common unix login stack!"),
-            {},
-            QStringLiteral("FTP configurator detected, that you vsftpd PAM config file has no such lines."),
-            {},
-            QStringLiteral("Variant 1: you have not configured vsftpd PAM file."),
-            QStringLiteral("Solution: Allow FTP configurator to attempt to fix this problem or fix it manually"),
-            {},
-            QStringLiteral("Variant 2: you have valid vsftpd PAM configuration, but done in different manner then FTP "
-                           "configurator expects."),
-            QStringLiteral(
-                "Solution: select \"Valid\", and FTP configurator will not notify you about this \"problem\" "
-                "any more."),
-        };
+        // Paragraphs one a line, an empty line between blocks.
+        const QString expected = QStringLiteral(
+            "Your vsftpd PAM configuration seems to be invalid. In order to allow the virtual user mechanism function "
+            "properly, PAM vsftpd config file must contain something like these lines:\n\n"
+            "auth    sufficient  /lib/security/pam_userdb.so db=/var/lib/ftpconfig/virtual_user_db\n"
+            "account sufficient  /lib/security/pam_userdb.so db=/var/lib/ftpconfig/virtual_user_db\n\n"
+            "Note: these lines must be BEFORE common unix login stack!\n\n"
+            "FTP configurator detected, that you vsftpd PAM config file has no such lines.\n\n"
+            "Variant 1: you have not configured vsftpd PAM file.\n"
+            "Solution: Allow FTP configurator to attempt to fix this problem or fix it manually\n\n"
+            "Variant 2: you have valid vsftpd PAM configuration, but done in different manner then FTP configurator "
+            "expects.\nSolution: select \"Valid\", and FTP configurator will not notify you about this \"problem\" any "
+            "more.");
         QStringList paragraphs;
         QStringList emphasised;
         for (QTextBlock block = browser->document()->begin(); block.isValid(); block = block.next()) {
@@ -208,11 +200,9 @@ private Q_SLOTS:
             if (first.isValid() && first.charFormat().fontWeight() == QFont::Bold)
                 emphasised << QStringLiteral("bold:") + first.text();
         }
-        QCOMPARE(paragraphs, expected);
+        QCOMPARE(paragraphs.join(QLatin1Char('\n')), expected);
         QCOMPARE(emphasised,
-                 (QStringList{QStringLiteral("italic:auth   "), QStringLiteral("italic:account"),
-                              QStringLiteral("bold:Note"), QStringLiteral("bold:Variant 1"),
-                              QStringLiteral("bold:Variant 2")}));
+                 strings("italic:auth   ", "italic:account", "bold:Note", "bold:Variant 1", "bold:Variant 2"));
     }
 
     void pamDialog_data()
