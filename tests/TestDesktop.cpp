@@ -1,4 +1,5 @@
 #include "ModalHelper.h"
+#include "TemporaryRoot.h"
 #include "TestMain.h"
 #include "app/VexHelpMenu.h"
 #include "app/VexIcon.h"
@@ -35,26 +36,23 @@ private Q_SLOTS:
     void initTestCase()
     {
         QVERIFY(m_dir.isValid());
-        QSettings::setPath(QSettings::NativeFormat, QSettings::UserScope, m_dir.filePath(QStringLiteral("settings")));
+        QSettings::setPath(QSettings::NativeFormat, QSettings::UserScope, m_dir.filePath(QStringLiteral("/settings")));
         vexInit("9.8.7", "Describes <the> program");
 
         // A theme with a plain base icon and an emblem of another colour.
-        const QString theme = m_dir.filePath(QStringLiteral("icons/testtheme"));
-        QVERIFY(QDir().mkpath(theme));
-        QFile index(theme + QStringLiteral("/index.theme"));
-        QVERIFY(index.open(QIODevice::WriteOnly));
-        index.write("[Icon Theme]\nName=testtheme\nDirectories=32x32/apps\n\n[32x32/apps]\nSize=32\nType=Fixed\n");
-        index.close();
+        const QString theme = m_dir.filePath(QStringLiteral("/icons/testtheme"));
+        QVERIFY(m_dir.writeFile(
+            QStringLiteral("/icons/testtheme/index.theme"),
+            "[Icon Theme]\nName=testtheme\nDirectories=32x32/apps\n\n[32x32/apps]\nSize=32\nType=Fixed\n"));
         QVERIFY(writeSolidPng(theme + QStringLiteral("/32x32/apps/user.png"), baseColour));
         QVERIFY(writeSolidPng(theme + QStringLiteral("/32x32/apps/emblem-system.png"), emblemColour));
-        QIcon::setThemeSearchPaths({m_dir.filePath(QStringLiteral("icons"))});
+        QIcon::setThemeSearchPaths({m_dir.filePath(QStringLiteral("/icons"))});
         QIcon::setThemeName(QStringLiteral("testtheme"));
     }
 
     void cleanup()
     {
-        for (QWidget *widget : QApplication::topLevelWidgets())
-            QVERIFY2(!widget->isVisible(), qPrintable(widget->windowTitle() + QLatin1Char(' ') + widget->objectName()));
+        QCOMPARE(ModalHelper::shownWindow(), QString());
     }
 
     void iconResources_data()
@@ -159,11 +157,11 @@ private Q_SLOTS:
         QCOMPARE(second.geometry().size(), QSize(321, 234));
         // Each key keeps its own; the settings live under the fixed scope.
         QVERIFY(QSettings().contains(QStringLiteral("geometry/other")));
-        QCOMPARE(QSettings().fileName(), m_dir.filePath(QStringLiteral("settings/ftpconfig/ftpconfig.conf")));
+        QCOMPARE(QSettings().fileName(), m_dir.filePath(QStringLiteral("/settings/ftpconfig/ftpconfig.conf")));
     }
 
 private:
-    QTemporaryDir m_dir;
+    TemporaryRoot m_dir;
 };
 
 FTPCONFIG_TEST_MAIN(TestDesktop)

@@ -62,8 +62,7 @@ private Q_SLOTS:
 
     void cleanup()
     {
-        for (QWidget *widget : QApplication::topLevelWidgets())
-            QVERIFY2(!widget->isVisible(), qPrintable(widget->windowTitle() + QLatin1Char(' ') + widget->objectName()));
+        QCOMPARE(ModalHelper::shownWindow(), QString());
     }
 
     // First, while the process has no other threads to lose in the fork. The

@@ -97,8 +97,7 @@ private Q_SLOTS:
 
     void cleanup()
     {
-        for (QWidget *widget : QApplication::topLevelWidgets())
-            QVERIFY2(!widget->isVisible(), qPrintable(widget->windowTitle() + QLatin1Char(' ') + widget->objectName()));
+        QCOMPARE(ModalHelper::shownWindow(), QString());
     }
 
     void refusalBox()

@@ -100,28 +100,26 @@ ModalHelper::~ModalHelper()
         qWarning("ModalHelper not checked: %s", qPrintable(report()));
 }
 
+template <typename Button>
+ModalHelper &ModalHelper::expectPress(const QString &text, Button button, const QString &name)
+{
+    const QString what = QStringLiteral("press \"%1\"").arg(name);
+    return expect(text, [this, button, what](QWidget *widget) {
+        if (!press(widget, button)) {
+            fail(QStringLiteral("could not %1 on %2").arg(what, summary(describe(widget))));
+            dismiss(widget);
+        }
+    });
+}
+
 ModalHelper &ModalHelper::expect(const QString &text, const QString &button)
 {
-    m_expectations.append({text, QStringLiteral("press \"%1\"").arg(button), [this, button](QWidget *widget) {
-                               if (!press(widget, button)) {
-                                   fail(
-                                       QStringLiteral("no button \"%1\" on %2").arg(button, summary(describe(widget))));
-                                   dismiss(widget);
-                               }
-                           }});
-    return *this;
+    return expectPress(text, button, button);
 }
 
 ModalHelper &ModalHelper::expect(const QString &text, QDialogButtonBox::StandardButton button)
 {
-    m_expectations.append(
-        {text, QStringLiteral("press standard button %1").arg(button), [this, button](QWidget *widget) {
-             if (!press(widget, button)) {
-                 fail(QStringLiteral("no standard button %1 on %2").arg(button).arg(summary(describe(widget))));
-                 dismiss(widget);
-             }
-         }});
-    return *this;
+    return expectPress(text, button, QStringLiteral("standard button %1").arg(button));
 }
 
 ModalHelper &ModalHelper::expect(const QString &text, Action action)
@@ -168,6 +166,15 @@ QString ModalHelper::report() const
     for (const Expectation &expectation : m_expectations)
         lines << QStringLiteral("never came up: \"%1\" (%2)").arg(expectation.text, expectation.what);
     return lines.join(QLatin1Char('\n'));
+}
+
+QString ModalHelper::shownWindow()
+{
+    for (QWidget *widget : QApplication::topLevelWidgets()) {
+        if (widget->isVisible())
+            return widget->windowTitle() + QLatin1Char(' ') + widget->objectName();
+    }
+    return QString();
 }
 
 const QList<ModalHelper::Seen> &ModalHelper::seen() const

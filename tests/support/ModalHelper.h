@@ -69,6 +69,9 @@ public:
     // Why done() is false, one line per problem.
     QString report() const;
     const QList<Seen> &seen() const;
+    // The title and object name of a top-level widget still shown, for the
+    // cleanup() of a test; nothing when none is.
+    static QString shownWindow();
 
 protected:
     bool eventFilter(QObject *watched, QEvent *event) override;
@@ -81,6 +84,7 @@ private:
         Action action;
     };
 
+    template <typename Button> ModalHelper &expectPress(const QString &text, Button button, const QString &name);
     void poll();
     void fail(const QString &why);
 
