@@ -5,6 +5,7 @@
 // editor, then each dialog and box of the engine's questions, the way the
 // program shows them.
 #include "ModalHelper.h"
+#include "WindowFixture.h"
 #include "app/CMainWindow.h"
 #include "app/LoginCheckDock.h"
 #include "app/VexIntegration.h"
@@ -57,13 +58,6 @@ ModalHelper::Action shot(const QString &name, const QString &button)
     };
 }
 
-QModelIndex userIndex(TreeModel &model, const QString &name, int column = TreeModel::UsersColumn)
-{
-    const QModelIndexList found
-        = model.match(model.index(0, 0), Qt::DisplayRole, name, 1, Qt::MatchExactly | Qt::MatchRecursive);
-    return found.isEmpty() ? QModelIndex() : found.first().siblingAtColumn(column);
-}
-
 Interaction::Question question(const QString &text, const QString &informative, const QString &detailed,
                                QList<Interaction::Button> buttons, const QString &acceptText = {})
 {
@@ -99,7 +93,7 @@ int main(int argc, char **argv)
         return 1;
     }
     TreeModel &model = *window.model();
-    const QModelIndex user = window.proxy()->mapFromSource(userIndex(model, selected));
+    const QModelIndex user = window.proxy()->mapFromSource(WindowFixture::find(model, selected));
     if (!user.isValid()) {
         std::fprintf(stderr, "no user %s in the table\n", qPrintable(selected));
         return 1;
@@ -124,7 +118,7 @@ int main(int argc, char **argv)
     ModalHelper modal(10000);
     const QString refusal = QStringLiteral("Unable to change access status.");
     modal.expect(refusal, shot(QStringLiteral("window-refusal-box"), QStringLiteral("OK")));
-    model.setData(userIndex(model, refused, TreeModel::StatusColumn), QStringLiteral("allowed"));
+    model.setData(WindowFixture::find(model, refused, TreeModel::StatusColumn), QStringLiteral("allowed"));
 
     const QString pamTitle = QStringLiteral("PAM configuration problem");
     modal.expect(pamTitle, shot(QStringLiteral("window-pam-dialog"), QStringLiteral("Skip")));
@@ -133,8 +127,8 @@ int main(int argc, char **argv)
 
     // The mode cell's editor over the window, on the anonymous row.
     modal.expect(QStringLiteral("Dialog"), shot(QStringLiteral("permissions-editor"), QStringLiteral("Cancel")));
-    window.view()->edit(
-        window.proxy()->mapFromSource(userIndex(model, AppStrings::instance().anonymousUsers, TreeModel::ModeColumn)));
+    window.view()->edit(window.proxy()->mapFromSource(
+        WindowFixture::find(model, AppStrings::instance().anonymousUsers, TreeModel::ModeColumn)));
 
     // The dialogs alone.
     window.hide();

@@ -66,12 +66,15 @@ struct WindowFixture
     }
 
     // Any row by its text: users and groups.
+    static QModelIndex find(const TreeModel &model, const QString &name, int column = TreeModel::UsersColumn)
+    {
+        const QModelIndexList found
+            = model.match(model.index(0, 0), Qt::DisplayRole, name, 1, Qt::MatchExactly | Qt::MatchRecursive);
+        return found.isEmpty() ? QModelIndex() : found.first().siblingAtColumn(column);
+    }
     QModelIndex source(const QString &name, int column = TreeModel::UsersColumn) const
     {
-        TreeModel *model = window->model();
-        const QModelIndexList found
-            = model->match(model->index(0, 0), Qt::DisplayRole, name, 1, Qt::MatchExactly | Qt::MatchRecursive);
-        return found.isEmpty() ? QModelIndex() : found.first().siblingAtColumn(column);
+        return find(*window->model(), name, column);
     }
     QModelIndex viewIndex(const QString &name, int column = TreeModel::UsersColumn) const
     {
