@@ -47,8 +47,6 @@ QStringList storedKeys()
 }
 
 const QString createTitle = QStringLiteral("Create virtual user");
-const QString editTitle = QStringLiteral("Edit virtual user");
-const QString selectMessage = QStringLiteral("Please, select virtual user which has to be changed.");
 
 // Types into the dialog (the first keystroke is what releases Ok), then
 // presses Ok; okHeldBack tells whether Ok was disabled before.
@@ -561,7 +559,7 @@ private Q_SLOTS:
         }
         QVERIFY(m_f.select(QStringLiteral("carol")));
         QStringList shown;
-        modal.expect(editing ? editTitle : createTitle, [&](QWidget *widget) {
+        modal.expect(editing ? QStringLiteral("Edit virtual user") : createTitle, [&](QWidget *widget) {
             shown = fields(qobject_cast<CreateVUserDialog *>(widget));
             fillAndAccept(typed)(widget);
         });
@@ -602,7 +600,7 @@ private Q_SLOTS:
 
         QVERIFY(m_f.select(row));
         ModalHelper modal;
-        modal.expect(selectMessage, QStringLiteral("OK"));
+        modal.expect(QStringLiteral("Please, select virtual user which has to be changed."), QStringLiteral("OK"));
         if (editing)
             m_f.window->editUser();
         else
