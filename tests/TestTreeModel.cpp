@@ -84,6 +84,11 @@ QStringList childNames(const QAbstractItemModel &model, const QModelIndex &paren
     return names;
 }
 
+QString verdict(bool allowed)
+{
+    return allowed ? QStringLiteral("allowed") : QStringLiteral("denied");
+}
+
 bool sameIcon(const QVariant &decoration, const char *resource)
 {
     return decoration.value<QIcon>().pixmap(16).toImage() == QIcon(QLatin1String(resource)).pixmap(16).toImage();
@@ -123,47 +128,36 @@ private slots:
     void users_data()
     {
         QTest::addColumn<QString>("name");
-        QTest::addColumn<QString>("status");
+        QTest::addColumn<bool>("allowed");
         QTest::addColumn<int>("kind");
         QTest::addColumn<QString>("directory");
-        QTest::addColumn<QString>("server");
+        QTest::addColumn<bool>("serverAllows");
 
-        QTest::newRow("plain local user") << "bob"
-                                          << "allowed" << 0 << "/home/bob"
-                                          << "allowed";
-        QTest::newRow("listed in ftpusers") << "root"
-                                            << "denied" << 1 << "/root"
-                                            << "denied";
-        QTest::newRow("locked in shadow") << "locked"
-                                          << "denied" << 5 << "/home/locked"
-                                          << "denied";
-        QTest::newRow("virtual without guest mode") << "vic"
-                                                    << "denied" << 3 << ""
-                                                    << "denied";
-        QTest::newRow("anonymous row") << "Anonymous users"
-                                       << "allowed" << 0 << "/srv/ftp"
-                                       << "allowed";
+        QTest::newRow("plain local user") << "bob" << true << 0 << "/home/bob" << true;
+        QTest::newRow("listed in ftpusers") << "root" << false << 1 << "/root" << false;
+        QTest::newRow("locked in shadow") << "locked" << false << 5 << "/home/locked" << false;
+        QTest::newRow("virtual without guest mode") << "vic" << false << 3 << "" << false;
+        QTest::newRow("anonymous row") << "Anonymous users" << true << 0 << "/srv/ftp" << true;
     }
 
     void users()
     {
         QFETCH(QString, name);
-        QFETCH(QString, status);
+        QFETCH(bool, allowed);
         QFETCH(int, kind);
         QFETCH(QString, directory);
-        QFETCH(QString, server);
+        QFETCH(bool, serverAllows);
 
         Table table;
         QVERIFY(
             table.load({{QStringLiteral("/etc/vsftpd.conf"), "listen=YES\nlocal_enable=YES\nanonymous_enable=YES\n"}}));
-        QCOMPARE(table.cell(name, TreeModel::StatusColumn), status);
+        QCOMPARE(table.cell(name, TreeModel::StatusColumn), verdict(allowed));
         QCOMPARE(table.model->failure(table.user(name))->kind, static_cast<FailureKind>(kind));
         QVERIFY(sameIcon(table.user(name).data(Qt::DecorationRole),
-                         status == QLatin1String("allowed") ? ":/prefix/icons/user_green.png"
-                                                            : ":/prefix/icons/user_red.png"));
+                         allowed ? ":/prefix/icons/user_green.png" : ":/prefix/icons/user_red.png"));
         QCOMPARE(table.cell(name, TreeModel::DirectoryColumn), directory);
         QVERIFY(!table.cell(name, TreeModel::ModeColumn).isEmpty());
-        QVERIFY2(table.cell(name, TreeModel::ServerColumn) == server,
+        QVERIFY2(table.cell(name, TreeModel::ServerColumn) == verdict(serverAllows),
                  qPrintable(table.user(name, TreeModel::ServerColumn).data(Qt::ToolTipRole).toString()));
         // The tool tips explain: the verdict's kind and message, the server's
         // first finding.
@@ -183,37 +177,30 @@ private slots:
         QTest::addColumn<QString>("name");
         QTest::addColumn<int>("column");
         QTest::addColumn<QString>("value");
+        QTest::addColumn<bool>("unsaved");
         QTest::addColumn<QString>("expected"); // the cell afterwards
         QTest::addColumn<QStringList>("texts"); // what the operator was told
-        QTest::addColumn<bool>("unsaved");
 
-        const QString refused = QStringLiteral("|Unable to change access status.|Failed check type: ");
-        QTest::newRow("allow a user the userlist blocks") << "alice" << 1 << "allowed"
-                                                          << "allowed" << QStringList() << true;
-        QTest::newRow("deny through the userlist") << "bob" << 1 << "denied"
-                                                   << "denied" << QStringList() << true;
+        const QString invalid = QStringLiteral("|Unable to set data. Data is invalid.");
+        QTest::newRow("allow a user the userlist blocks")
+            << "alice" << 1 << "allowed" << true << "allowed" << QStringList();
+        QTest::newRow("deny through the userlist") << "bob" << 1 << "denied" << true << "denied" << QStringList();
         QTest::newRow("allow root: ftpusers repaired, shadow refuses")
-            << "root" << 1 << "allowed"
-            << "denied"
-            << QStringList{refused
-                           + QLatin1String("/etc/passwd or /etc/shadow|***Result: FALSE. Check: user root  has bad "
-                                           "passwd in /etc/shadow (* or !).")}
-            << false;
-        QTest::newRow("allow a virtual user: guest mode") << "vic" << 1 << "allowed"
-                                                          << "allowed" << QStringList() << true;
-        QTest::newRow("anonymous off") << "Anonymous users" << 1 << "denied"
-                                       << "denied" << QStringList() << true;
-        QTest::newRow("no such status") << "bob" << 1 << "maybe"
-                                        << "allowed"
-                                        << strings("|Unable to set data. Data is invalid. Reason is unknown") << false;
+            << "root" << 1 << "allowed" << false << "denied"
+            << strings("|Unable to change access status.|Failed check type: /etc/passwd or /etc/shadow|***Result: "
+                       "FALSE. Check: user root  has bad passwd in /etc/shadow (* or !).");
+        QTest::newRow("allow a virtual user: guest mode")
+            << "vic" << 1 << "allowed" << true << "allowed" << QStringList();
+        QTest::newRow("anonymous off") << "Anonymous users" << 1 << "denied" << true << "denied" << QStringList();
+        QTest::newRow("no such status") << "bob" << 1 << "maybe" << false << "allowed"
+                                        << QStringList{invalid + QLatin1String(" Reason is unknown")};
         QTest::newRow("rename a local user")
-            << "bob" << 0 << "robert"
-            << "bob" << strings("|You can change only virtual user names. Skipping change bob to robert") << false;
+            << "bob" << 0 << "robert" << false << "bob"
+            << strings("|You can change only virtual user names. Skipping change bob to robert");
         QTest::newRow("rename a virtual user to a bad name")
-            << "vic" << 0 << ".hidden"
-            << "vic" << strings("|Unable to set data. Data is invalid.||the name begins with \".\"") << false;
-        QTest::newRow("rights") << "bob" << 3 << "download, upload"
-                                << "download, upload" << QStringList() << true;
+            << "vic" << 0 << ".hidden" << false << "vic"
+            << QStringList{invalid + QLatin1String("||the name begins with \".\"")};
+        QTest::newRow("rights") << "bob" << 3 << "download, upload" << true << "download, upload" << QStringList();
     }
 
     void edits()
@@ -221,9 +208,9 @@ private slots:
         QFETCH(QString, name);
         QFETCH(int, column);
         QFETCH(QString, value);
+        QFETCH(bool, unsaved);
         QFETCH(QString, expected);
         QFETCH(QStringList, texts);
-        QFETCH(bool, unsaved);
 
         Table table;
         QVERIFY(table.load({{QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf"), "alice\n"}}));
