@@ -283,19 +283,16 @@ private Q_SLOTS:
 
     void statusChoiceCommitsAtOnce_data()
     {
-        QTest::addColumn<QString>("user");
-        QTest::addColumn<QString>("before");
+        QTest::addColumn<QString>("before"); // bob's status
         QTest::addColumn<int>("openIndex");
         QTest::addColumn<QString>("after");
-        QTest::newRow("denied bob, allowed") << "bob"
-                                             << "denied" << 0 << "allowed";
-        QTest::newRow("allowed bob, denied") << "bob"
-                                             << "allowed" << 1 << "denied";
+        QTest::newRow("denied bob, allowed") << "denied" << 0 << "allowed";
+        QTest::newRow("allowed bob, denied") << "allowed" << 1 << "denied";
     }
 
     void statusChoiceCommitsAtOnce()
     {
-        QFETCH(QString, user);
+        const QString user = QStringLiteral("bob");
         QFETCH(QString, before);
         QFETCH(int, openIndex);
         QFETCH(QString, after);
