@@ -7,6 +7,7 @@
 #include <QFile>
 #include <QFileInfo>
 
+#include <dirent.h>
 #include <fstream>
 #include <sys/stat.h>
 
@@ -68,6 +69,8 @@ LoginForecast::LoginForecast(FtpServerConfig &config, QDate today)
     , m_today(today)
     , m_settings(config.mainConfig().elements)
     , m_mainPath(AppStrings::instance().mainConfigPath)
+    , m_anonymousRow(AppStrings::instance().anonymousUsers.toLocal8Bit())
+    , m_anonymousOn(m_settings.isYes("anonymous_enable", true))
 {
     checkServer();
 }
@@ -194,9 +197,26 @@ const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
         QByteArray directory = m_settings.value("user_config_dir");
         if (!directory.endsWith('/'))
             directory += '/';
+        // Most users have no file: the directory is listed once, and only
+        // the names it holds are opened (a name with a "/" goes below it).
+        if (!m_userFileNamesRead) {
+            m_userFileNamesRead = true;
+            m_userFileNames.emplace();
+            const QByteArray onDisk = QFile::encodeName(m_config.root().resolve(text(directory)));
+            if (DIR *listed = ::opendir(onDisk.constData())) {
+                while (const dirent *entry = ::readdir(listed))
+                    m_userFileNames->insert(QByteArray(entry->d_name));
+                ::closedir(listed);
+            } else {
+                m_userFileNames.reset();
+            }
+        }
         std::unique_ptr<VsftpdSettings> settings;
         const QString path = m_config.root().resolve(text(directory + login));
-        std::ifstream in(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
+        std::ifstream in;
+        // A directory that cannot be listed is tried name by name.
+        if (!m_userFileNames || login.contains('/') || m_userFileNames->contains(login))
+            in.open(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
         if (in.is_open() && QFileInfo(path).isFile()) {
             ConfigFile file(SyntaxMode::KeyValue);
             file.parse(in);
@@ -213,16 +233,16 @@ std::optional<ForecastFinding> LoginForecast::checkRoot(const QByteArray &accoun
 {
     AccountRecord record;
     m_config.accounts().getUserInfo(account, record);
-    const QString path = m_config.root().resolve(text(directory));
-    struct stat info
-    {
-    };
-    if (directory.isEmpty() || ::stat(QFile::encodeName(path).constData(), &info) != 0 || !S_ISDIR(info.st_mode)) {
+    std::optional<struct stat> status;
+    if (!directory.isEmpty())
+        status = m_config.fileStatus(m_config.root().resolve(text(directory)));
+    if (!status || !S_ISDIR(status->st_mode)) {
         return ForecastFinding{Severity::Error, QString(), 0,
                                QStringLiteral("%1 %2 does not exist: vsftpd ends the session (cannot change "
                                               "directory)")
                                    .arg(what, text(directory))};
     }
+    const struct stat &info = *status;
     int shift = 0;
     if (record.uid == 0)
         shift = -1;
@@ -251,26 +271,23 @@ std::optional<ForecastFinding> LoginForecast::checkRoot(const QByteArray &accoun
 
 UserForecast LoginForecast::forecast(const QByteArray &user)
 {
-    if (m_serverFails) {
-        UserForecast result{ForecastStatus::Denied, {}};
-        for (const ForecastFinding &finding : m_serverFindings) {
-            if (finding.severity == Severity::Error)
-                result.findings.append(finding);
-        }
-        return result;
+    UserForecast result = userForecast(user);
+    for (const ForecastFinding &finding : m_serverFindings) {
+        if (!m_serverFails || finding.severity == Severity::Error)
+            result.findings.append(finding);
     }
-    UserForecast result;
+    return result;
+}
+
+UserForecast LoginForecast::userForecast(const QByteArray &user)
+{
+    if (m_serverFails)
+        return UserForecast{ForecastStatus::Denied, {}};
     // The table's anonymous row, and the names vsftpd itself takes for
     // anonymous logins while they are on.
-    const bool anonymousOn = m_settings.isYes("anonymous_enable", true);
-    if (user == AppStrings::instance().anonymousUsers.toLocal8Bit()
-        || (anonymousOn && (user == "anonymous" || user == "ftp")))
-        result = forecastAnonymous();
-    else
-        result = forecastLogin(user);
-    for (const ForecastFinding &finding : m_serverFindings)
-        result.findings.append(finding);
-    return result;
+    if (user == m_anonymousRow || (m_anonymousOn && (user == "anonymous" || user == "ftp")))
+        return forecastAnonymous();
+    return forecastLogin(user);
 }
 
 UserForecast LoginForecast::forecastAnonymous()
@@ -416,7 +433,8 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
         const QByteArray token = setting("user_sub_token") ? setting("user_sub_token")->value : QByteArray();
         if (!token.isEmpty())
             directory.replace(token, login);
-        if (QFileInfo(m_config.root().resolve(text(directory))).isDir()) {
+        const auto status = m_config.fileStatus(m_config.root().resolve(text(directory)));
+        if (status && S_ISDIR(status->st_mode)) {
             root = directory;
             rootWhat = QStringLiteral("the local_root");
         } else if (chrooted) {

@@ -51,8 +51,11 @@ public:
     bool serverFails() const;
 
     // A user of the table: a local account, a virtual user, or the
-    // anonymous row.
+    // anonymous row. The findings end with the server-wide ones.
     UserForecast forecast(const QByteArray &user);
+    // The same without the server-wide findings, for a listing that gives
+    // them once for all users: a failing server leaves none of the user's.
+    UserForecast userForecast(const QByteArray &user);
 
 private:
     UserForecast forecastAnonymous();
@@ -67,6 +70,8 @@ private:
     QDate m_today;
     VsftpdSettings m_settings;
     QString m_mainPath;
+    QByteArray m_anonymousRow;
+    bool m_anonymousOn;
     QList<ForecastFinding> m_serverFindings;
     bool m_serverFails = false;
     QByteArray m_userlistFile;
@@ -76,6 +81,10 @@ private:
     std::unique_ptr<ConfigFile> m_ownPam; // when the server's service is another
     std::unique_ptr<PamForecast> m_pam;
     std::map<QByteArray, std::unique_ptr<VsftpdSettings>> m_userFiles;
+    // The names in user_config_dir, listed when the first user is looked
+    // up; none when it cannot be listed.
+    std::optional<QSet<QByteArray>> m_userFileNames;
+    bool m_userFileNamesRead = false;
 };
 
 QString forecastStatusText(ForecastStatus status);

@@ -15,6 +15,39 @@ FtpServerConfig::FtpServerConfig(Interaction &interaction, const RootDirectory &
 
 FtpServerConfig::~FtpServerConfig() = default;
 
+FtpServerConfig::MetadataPass::MetadataPass(FtpServerConfig &config)
+    : m_config(config)
+    , m_outer(!config.m_pass)
+{
+    if (m_outer)
+        m_config.m_pass = std::make_unique<PassCache>();
+}
+
+FtpServerConfig::MetadataPass::~MetadataPass()
+{
+    if (m_outer)
+        m_config.m_pass.reset();
+}
+
+std::optional<struct stat> FtpServerConfig::fileStatus(const QString &resolvedPath) const
+{
+    const auto read = [&]() -> std::optional<struct stat>
+    {
+        struct stat info
+        {
+        };
+        if (::stat(QFile::encodeName(resolvedPath).constData(), &info) != 0)
+            return std::nullopt;
+        return info;
+    };
+    if (!m_pass)
+        return read();
+    auto it = m_pass->metadata.constFind(resolvedPath);
+    if (it == m_pass->metadata.constEnd())
+        it = m_pass->metadata.insert(resolvedPath, read());
+    return *it;
+}
+
 QString FtpServerConfig::resolved(const QByteArray &path) const
 {
     return m_root.resolve(QFile::decodeName(path));
@@ -32,10 +65,23 @@ QByteArray FtpServerConfig::configuredChrootListPath() const
     return value("chroot_list_file", "/etc/vsftpd.chroot_list");
 }
 
+std::optional<QByteArray> FtpServerConfig::mainValue(const QByteArray &key) const
+{
+    const auto read = [&]() -> std::optional<QByteArray> {
+        const auto data = findData(m_main.elements, "", str(key));
+        return data ? std::optional<QByteArray>(QByteArray::fromStdString(data->value)) : std::nullopt;
+    };
+    if (!m_pass)
+        return read();
+    auto it = m_pass->values.constFind(key);
+    if (it == m_pass->values.constEnd())
+        it = m_pass->values.insert(key, read());
+    return *it;
+}
+
 QByteArray FtpServerConfig::value(const QByteArray &key, const QByteArray &defaultValue) const
 {
-    const auto data = findData(m_main.elements, "", str(key));
-    return data ? QByteArray::fromStdString(data->value) : defaultValue;
+    return mainValue(key).value_or(defaultValue);
 }
 
 bool FtpServerConfig::isYes(const QByteArray &key, bool absentMeansYes) const
@@ -99,12 +145,12 @@ QByteArray FtpServerConfig::configuredRoot(const QByteArray &user) const
         return m_accounts && m_accounts->getUserInfo(account, record) ? record.home : QByteArray();
     };
     if (isAnonymousUser(user)) {
-        if (const auto anonRoot = findData(m_main.elements, "", "anon_root"))
-            return QByteArray::fromStdString(anonRoot->value);
+        if (const auto anonRoot = mainValue("anon_root"))
+            return *anonRoot;
         return homeOf(value("guest_username", "ftp"));
     }
-    if (const auto localRoot = findData(m_main.elements, "", "local_root"))
-        return QByteArray::fromStdString(localRoot->value);
+    if (const auto localRoot = mainValue("local_root"))
+        return *localRoot;
     if (isVirtualUser(user) && isYes("guest_enable"))
         return homeOf(value("guest_username", "ftp"));
     return homeOf(user);

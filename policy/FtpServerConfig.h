@@ -9,6 +9,7 @@
 
 #include <QByteArray>
 #include <QCoreApplication>
+#include <QHash>
 #include <QSet>
 #include <QString>
 #include <QStringList>
@@ -16,6 +17,8 @@
 #include <map>
 #include <memory>
 #include <optional>
+
+#include <sys/stat.h>
 
 // Everything that decides who may use the FTP server, held in memory: the
 // main configuration, the PAM service file, the lists, the per-user files,
@@ -51,6 +54,28 @@ public:
     // Reads every file; a fatal problem ends the process through the
     // interaction with status -1.
     void load();
+
+    // While a pass is open, the checks and the forecast read the metadata of
+    // each path and each main configuration value once: a pass over every
+    // user stats the same guest root and database file once, not once a
+    // user. A check with repair reads afresh and empties the cache, since
+    // it may create directories and change values; nothing else may change
+    // the documents while a pass is open. Passes nest.
+    class MetadataPass
+    {
+    public:
+        explicit MetadataPass(FtpServerConfig &config);
+        ~MetadataPass();
+        MetadataPass(const MetadataPass &) = delete;
+        MetadataPass &operator=(const MetadataPass &) = delete;
+
+    private:
+        FtpServerConfig &m_config;
+        bool m_outer;
+    };
+    // stat() of a path already resolved under the root, following links;
+    // empty when it fails.
+    std::optional<struct stat> fileStatus(const QString &resolvedPath) const;
 
     // May the user log in? With repair, each refusal that a change of the
     // in-memory files can cure is cured, and the operator is asked where a
@@ -176,6 +201,8 @@ private:
     QStringList readNameList(const QByteArray &path) const;
     bool ftpusersListed(const QByteArray &name);
     QString resolved(const QByteArray &path) const;
+    // The main configuration's value of a key; empty when it is absent.
+    std::optional<QByteArray> mainValue(const QByteArray &key) const;
     bool ensureDirectoryOf(const QString &path);
     bool fixPamUserdb();
     void remember(const QString &key, const ConfigFile &document);
@@ -218,6 +245,14 @@ private:
     QByteArray m_dbConfiguredPath; // as the PAM file's db= names it
     std::unique_ptr<AccountStore> m_accounts;
     bool m_modified = false;
+    // What the open pass read: metadata by resolved path, main configuration
+    // values by key. None when no pass is open.
+    struct PassCache
+    {
+        QHash<QString, std::optional<struct stat>> metadata;
+        QHash<QByteArray, std::optional<QByteArray>> values;
+    };
+    mutable std::unique_ptr<PassCache> m_pass;
     // How each document printed when it was loaded: a save leaves a file
     // that would print the same untouched, byte for byte.
     std::map<QString, std::string> m_loadedText;

@@ -11,6 +11,7 @@
 #include <iostream>
 #include <sys/stat.h>
 #include <unistd.h>
+#include <utility>
 
 bool FtpServerConfig::checkAccess(const QByteArray &user, bool repair, AccessFailure *failure)
 {
@@ -19,6 +20,23 @@ bool FtpServerConfig::checkAccess(const QByteArray &user, bool repair, AccessFai
         &FtpServerConfig::checkMainConfig, &FtpServerConfig::checkReserved, &FtpServerConfig::checkRootDirectory,
         &FtpServerConfig::checkFtpusers,   &FtpServerConfig::checkUserlist, &FtpServerConfig::checkPassword,
     };
+    // A repair may create what the pass saw missing and change values: it
+    // reads afresh, and what was read before it is forgotten.
+    std::unique_ptr<PassCache> pass;
+    if (repair && m_pass)
+        pass = std::exchange(m_pass, nullptr);
+    struct Restore
+    {
+        FtpServerConfig &config;
+        std::unique_ptr<PassCache> &pass;
+        ~Restore()
+        {
+            if (pass) {
+                *pass = PassCache();
+                config.m_pass = std::move(pass);
+            }
+        }
+    } restore{*this, pass};
     for (const Check check : checks) {
         if (!(this->*check)(user, repair, failure))
             return false;
@@ -29,23 +47,23 @@ bool FtpServerConfig::checkAccess(const QByteArray &user, bool repair, AccessFai
 bool FtpServerConfig::checkMainConfig(const QByteArray &user, bool repair, AccessFailure *failure)
 {
     if (isAnonymousUser(user)) {
-        const auto anonymous = findData(m_main.elements, "", "anonymous_enable");
+        const auto anonymous = mainValue("anonymous_enable");
         // The server's own default admits anonymous users.
-        if (!anonymous || QByteArray::fromStdString(anonymous->value).toLower() == "yes")
+        if (!anonymous || anonymous->toLower() == "yes")
             return true;
         if (repair) {
-            anonymous->value = "yes";
+            findData(m_main.elements, "", "anonymous_enable")->value = "yes";
             m_modified = true;
             return true;
         }
         return refuse(failure, FailureKind::MainConfig, refusal("main ftp config has anonymous_enable option != yes."));
     }
 
-    const auto local = findData(m_main.elements, "", "local_enable");
-    if (local && QByteArray::fromStdString(local->value).toLower() != "yes") {
+    const auto local = mainValue("local_enable");
+    if (local && local->toLower() != "yes") {
         if (!repair)
             return refuse(failure, FailureKind::MainConfig, refusal("main ftp config has local_enable != yes"));
-        local->value = "yes";
+        findData(m_main.elements, "", "local_enable")->value = "yes";
         m_modified = true;
     } else if (!local) {
         if (!repair)
@@ -75,7 +93,10 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
     const QByteArray directory = effectiveRoot(user);
     const QString shown = text(directory);
     const QString onDisk = resolved(directory);
-    if (directory.isEmpty() || !QFileInfo(onDisk).isDir()) {
+    std::optional<struct stat> info;
+    if (!directory.isEmpty())
+        info = fileStatus(onDisk);
+    if (!info || !S_ISDIR(info->st_mode)) {
         if (repair) {
             Interaction::Question question;
             question.message
@@ -99,14 +120,13 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
         return true;
 
     const QByteArray account = ftpAccountName(user);
-    struct stat info
-    {
-    };
-    if (::stat(QFile::encodeName(onDisk).constData(), &info) != 0)
+    // Read again: a repair above may have created it.
+    info = fileStatus(onDisk);
+    if (!info)
         return refuse(failure, FailureKind::Filesystem, refusal("user home directory %1 does not exist.").arg(shown));
     AccountRecord anonymous;
     const bool haveAccount = m_accounts && m_accounts->getUserInfo(account, anonymous);
-    if (haveAccount && info.st_uid == anonymous.uid) {
+    if (haveAccount && info->st_uid == anonymous.uid) {
         std::optional<QString> owner;
         if (repair) {
             QStringList names;
@@ -130,11 +150,11 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
 
     QByteArray groupName;
     if (m_accounts) {
-        const auto group = m_accounts->groups().find(info.st_gid);
+        const auto group = m_accounts->groups().find(info->st_gid);
         if (group != m_accounts->groups().end())
             groupName = group->second.name;
     }
-    if ((info.st_mode & S_IWGRP) && !groupName.isEmpty() && m_accounts->isUserInGroup(account, groupName)) {
+    if ((info->st_mode & S_IWGRP) && !groupName.isEmpty() && m_accounts->isUserInGroup(account, groupName)) {
         bool fixed = false;
         if (repair) {
             Interaction::Question question;
@@ -146,7 +166,7 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
             question.defaultButton = Interaction::Button::Yes;
             if (m_interaction.ask(question) == Interaction::Button::Yes) {
                 const QString absolute = QFileInfo(onDisk).absoluteFilePath();
-                fixed = ::chmod(QFile::encodeName(absolute).constData(), info.st_mode & 07777 & ~S_IWGRP) == 0;
+                fixed = ::chmod(QFile::encodeName(absolute).constData(), info->st_mode & 07777 & ~S_IWGRP) == 0;
             }
         }
         if (!fixed) {

@@ -51,6 +51,9 @@ void ReportInteraction::exitProcess(int status)
 Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
 {
     Report report;
+    // Every user's checks and forecast see the same guest root, lists and
+    // database: their metadata is read once.
+    const FtpServerConfig::MetadataPass pass(config);
     LoginForecast forecast(config);
     report.serverFindings = forecast.serverFindings();
     report.serverFails = forecast.serverFails();
@@ -62,7 +65,7 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
         row.allowed = config.checkAccess(name, false, &row.failure);
         row.directory = config.effectiveRoot(name);
         row.rights = rightsText(config.userRights(name));
-        row.forecast = forecast.forecast(name);
+        row.forecast = forecast.userForecast(name);
         if (!row.allowed && row.failure.message.isEmpty() && interaction.pamProblems > 0) {
             // The PAM check refuses without a message of its own when the
             // PAM file does not start its stacks with pam_userdb.so; it asks
@@ -111,11 +114,20 @@ QByteArray reportText(const Report &report)
     const QStringList header{QStringLiteral("USER"),   QStringLiteral("KIND"),      QStringLiteral("STATUS"),
                              QStringLiteral("SERVER"), QStringLiteral("DIRECTORY"), QStringLiteral("RIGHTS"),
                              QStringLiteral("FILE"),   QStringLiteral("REASON"),    QStringLiteral("SERVER SAYS")};
+    // Without a finding of their own, rows say the first server-wide one
+    // (the first error when the server fails): the same for every row.
+    QString serverSays;
+    for (const ForecastFinding &finding : report.serverFindings) {
+        if (!report.serverFails || finding.severity == ForecastFinding::Severity::Error) {
+            serverSays = findingText(finding);
+            break;
+        }
+    }
     QList<QStringList> table{header};
     const AppStrings &strings = AppStrings::instance();
     for (const ReportRow &row : rows) {
         const bool failed = !row.failure.message.isEmpty();
-        const QString said = row.forecast.findings.isEmpty() ? QString() : findingText(row.forecast.findings.first());
+        const QString said = row.forecast.findings.isEmpty() ? serverSays : findingText(row.forecast.findings.first());
         table.append({QString::fromUtf8(row.name), row.kind, row.allowed ? strings.allowed : strings.denied,
                       forecastStatusText(row.forecast.status), QString::fromUtf8(row.directory),
                       row.rights.isEmpty() ? QStringLiteral("-") : row.rights,
@@ -141,30 +153,91 @@ QByteArray reportText(const Report &report)
     return out;
 }
 
+namespace {
+
+// A JSON string as QJsonDocument writes it: plain printable ASCII as it is,
+// anything else through Qt itself.
+void appendJsonString(QByteArray &out, const QString &text)
+{
+    bool plain = true;
+    for (const QChar c : text) {
+        const ushort u = c.unicode();
+        if (u < 0x20 || u >= 0x7f || u == '"' || u == '\\') {
+            plain = false;
+            break;
+        }
+    }
+    if (plain) {
+        out += '"';
+        out += text.toLatin1();
+        out += '"';
+        return;
+    }
+    const QByteArray quoted = QJsonDocument(QJsonArray{text}).toJson(QJsonDocument::Compact);
+    out += quoted.mid(1, quoted.size() - 2);
+}
+
+// The findings array of a user at the indentation of the users' objects,
+// as QJsonDocument::Indented lays it out.
+void appendFindings(QByteArray &out, const QList<ForecastFinding> &findings)
+{
+    out += "[\n";
+    for (int i = 0; i < findings.size(); ++i) {
+        const ForecastFinding &finding = findings[i];
+        out += "                    {\n                        \"file\": ";
+        appendJsonString(out, finding.file);
+        out += ",\n                        \"line\": ";
+        out += QByteArray::number(finding.line);
+        out += ",\n                        \"message\": ";
+        appendJsonString(out, finding.message);
+        out += ",\n                        \"severity\": ";
+        appendJsonString(out, severityText(finding.severity));
+        out += i + 1 < findings.size() ? "\n                    },\n" : "\n                    }\n";
+    }
+    out += "                ]";
+}
+
+} // namespace
+
 QByteArray reportJson(const Report &report, const QString &root)
 {
-    const QList<ReportRow> &rows = report.rows;
-    QJsonArray users;
-    const AppStrings &strings = AppStrings::instance();
-    for (const ReportRow &row : rows) {
-        const bool failed = !row.failure.message.isEmpty();
-        users.append(QJsonObject{
-            {QStringLiteral("name"), QString::fromUtf8(row.name)},
-            {QStringLiteral("kind"), row.kind},
-            {QStringLiteral("status"), row.allowed ? strings.allowed : strings.denied},
-            {QStringLiteral("directory"), QString::fromUtf8(row.directory)},
-            {QStringLiteral("rights"), row.rights},
-            {QStringLiteral("failureKind"), failed ? static_cast<int>(row.failure.kind) : 0},
-            {QStringLiteral("failureText"), failed ? failureKindText(row.failure.kind) : QString()},
-            {QStringLiteral("message"), row.failure.message},
-            {QStringLiteral("forecast"),
-             QJsonObject{{QStringLiteral("status"), forecastStatusText(row.forecast.status)},
-                         {QStringLiteral("findings"), findingsJson(row.forecast.findings)}}},
-        });
-    }
+    // The document is printed without its users, and the users one by one
+    // into its place, in the layout and key order QJsonDocument gives them:
+    // a document holding every row would keep them all twice over.
     const QJsonObject server{{QStringLiteral("fails"), report.serverFails},
                              {QStringLiteral("findings"), findingsJson(report.serverFindings)}};
-    const QJsonObject document{
-        {QStringLiteral("root"), root}, {QStringLiteral("server"), server}, {QStringLiteral("users"), users}};
-    return QJsonDocument(document).toJson(QJsonDocument::Indented);
+    const QJsonObject frame{
+        {QStringLiteral("root"), root}, {QStringLiteral("server"), server}, {QStringLiteral("users"), QJsonArray{0}}};
+    // "users" sorts last: what follows its placeholder element closes the
+    // array and the document.
+    const QByteArray framed = QJsonDocument(frame).toJson(QJsonDocument::Indented);
+    const int placeholder = framed.lastIndexOf("        0\n");
+    QByteArray out = framed.left(placeholder);
+    const AppStrings &strings = AppStrings::instance();
+    for (int i = 0; i < report.rows.size(); ++i) {
+        const ReportRow &row = report.rows[i];
+        const bool failed = !row.failure.message.isEmpty();
+        out += "        {\n            \"directory\": ";
+        appendJsonString(out, QString::fromUtf8(row.directory));
+        out += ",\n            \"failureKind\": ";
+        out += QByteArray::number(failed ? static_cast<int>(row.failure.kind) : 0);
+        out += ",\n            \"failureText\": ";
+        appendJsonString(out, failed ? failureKindText(row.failure.kind) : QString());
+        out += ",\n            \"forecast\": {\n                \"findings\": ";
+        appendFindings(out, row.forecast.findings);
+        out += ",\n                \"status\": ";
+        appendJsonString(out, forecastStatusText(row.forecast.status));
+        out += "\n            },\n            \"kind\": ";
+        appendJsonString(out, row.kind);
+        out += ",\n            \"message\": ";
+        appendJsonString(out, row.failure.message);
+        out += ",\n            \"name\": ";
+        appendJsonString(out, QString::fromUtf8(row.name));
+        out += ",\n            \"rights\": ";
+        appendJsonString(out, row.rights);
+        out += ",\n            \"status\": ";
+        appendJsonString(out, row.allowed ? strings.allowed : strings.denied);
+        out += i + 1 < report.rows.size() ? "\n        },\n" : "\n        }\n";
+    }
+    return out + framed.mid(placeholder + 10);
 }
