@@ -4,10 +4,13 @@
 #include <QDir>
 #include <QFile>
 #include <QFileInfo>
+#include <QRandomGenerator>
+#include <QSet>
 
 #include <cerrno>
 #include <cstring>
 #include <fcntl.h>
+#include <map>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -82,75 +85,193 @@ std::optional<QString> linkTarget(const QString &path, const QString &trustedTop
     }
 }
 
-} // namespace
+// Files kept open at once while a batch is written: far below the usual
+// limit of 1,024 descriptors, and enough to share the waits for the disk.
+constexpr int MaxOpenFiles = 256;
 
-std::optional<QString> writeFileAtomically(const QString &linkPath, const QByteArray &content, mode_t newFileMode,
-                                           const QString &trustedTop)
+// A new file beside the target, named as mkstemp names one, but created
+// with its final mode: most files then need no chmod of their own.
+int createTemporary(QByteArray &name, mode_t mode)
+{
+    static const char letters[] = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789";
+    const int random = name.size() - 6;
+    for (int attempt = 0; attempt < 100; ++attempt) {
+        for (int i = 0; i < 6; ++i)
+            name[random + i] = letters[QRandomGenerator::global()->bounded(int(sizeof letters) - 1)];
+        const int fd = ::open(name.constData(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, mode);
+        if (fd >= 0 || errno != EEXIST)
+            return fd;
+    }
+    errno = EEXIST;
+    return -1;
+}
+
+void discard(AtomicBatch::Pending &file, const char *what, int error)
+{
+    if (file.fd >= 0)
+        ::close(file.fd);
+    file.fd = -1;
+    ::unlink(file.temporary.constData());
+    file.error = systemError(what, error);
+}
+
+// The temporary file of a target, written but not yet synced.
+void prepare(AtomicBatch::Pending &file, const QString &linkPath, const QByteArray &content, mode_t newFileMode,
+             const QString &trustedTop)
 {
     // A link root made is kept, and the file it leads to is replaced.
     QString path;
-    if (const auto refused = linkTarget(linkPath, QDir::cleanPath(trustedTop), path))
-        return refused;
-    const QByteArray target = QFile::encodeName(path);
+    if (const auto refused = linkTarget(linkPath, QDir::cleanPath(trustedTop), path)) {
+        file.error = refused;
+        return;
+    }
+    file.target = QFile::encodeName(path);
     const QFileInfo info(path);
-    const QByteArray directory = QFile::encodeName(info.absolutePath());
 
     mode_t mode = newFileMode;
     std::optional<std::pair<uid_t, gid_t>> owner;
     struct stat existing
     {
     };
-    if (::lstat(target.constData(), &existing) == 0) {
-        if (S_ISDIR(existing.st_mode))
-            return systemError("the target is a directory", EISDIR);
+    if (::lstat(file.target.constData(), &existing) == 0) {
+        if (S_ISDIR(existing.st_mode)) {
+            file.error = systemError("the target is a directory", EISDIR);
+            return;
+        }
         if (S_ISREG(existing.st_mode)) {
             mode = existing.st_mode & 07777;
             owner = std::make_pair(existing.st_uid, existing.st_gid);
         }
     }
 
-    QByteArray temporary = directory + "/." + QFile::encodeName(info.fileName()) + ".ftpconfig-XXXXXX";
-    const int fd = ::mkstemp(temporary.data());
-    if (fd < 0)
-        return systemError("cannot create a temporary file", errno);
-    const auto fail = [&](const char *what) {
-        const int error = errno;
-        ::close(fd);
-        ::unlink(temporary.constData());
-        return systemError(what, error);
+    file.temporary
+        = QFile::encodeName(info.absolutePath()) + "/." + QFile::encodeName(info.fileName()) + ".ftpconfig-XXXXXX";
+    file.fd = createTemporary(file.temporary, mode);
+    if (file.fd < 0) {
+        file.error = systemError("cannot create a temporary file", errno);
+        return;
+    }
+    // Each change of an inode is one more metadata update for the file
+    // system to order and write: the mode and owner are set only when the
+    // new file does not have them already.
+    struct stat created
+    {
     };
-    if (!writeAll(fd, content))
-        return fail("cannot write");
-    if (::fchmod(fd, mode) != 0)
-        return fail("cannot set the mode");
-    if (owner && ::fchown(fd, owner->first, owner->second) != 0)
-        return fail("cannot set the owner");
-    if (::fsync(fd) != 0)
-        return fail("cannot sync");
-    if (::close(fd) != 0) {
-        const int error = errno;
-        ::unlink(temporary.constData());
-        return systemError("cannot close", error);
+    if (!writeAll(file.fd, content))
+        discard(file, "cannot write", errno);
+    else if (::fstat(file.fd, &created) != 0)
+        discard(file, "cannot read the mode", errno);
+    else if ((created.st_mode & 07777) != mode && ::fchmod(file.fd, mode) != 0)
+        discard(file, "cannot set the mode", errno);
+    else if (owner && (created.st_uid != owner->first || created.st_gid != owner->second)
+             && ::fchown(file.fd, owner->first, owner->second) != 0)
+        discard(file, "cannot set the owner", errno);
+}
+
+// Temporary files of these targets in one directory that interrupted
+// writes left behind: one listing for them all.
+void removeStale(const QString &directory, const QSet<QString> &names)
+{
+    const QLatin1String marker(".ftpconfig-");
+    const int suffix = marker.size() + 6;
+    const QDir dir(directory);
+    for (const QString &entry : dir.entryList(QDir::Files | QDir::Hidden | QDir::System)) {
+        if (entry.size() > suffix + 1 && entry.startsWith(QLatin1Char('.'))
+            && entry.midRef(entry.size() - suffix, marker.size()) == marker
+            && names.contains(entry.mid(1, entry.size() - 1 - suffix)))
+            QFile::remove(dir.filePath(entry));
     }
-    if (::rename(temporary.constData(), target.constData()) != 0) {
-        const int error = errno;
-        ::unlink(temporary.constData());
-        return systemError("cannot rename", error);
+}
+
+} // namespace
+
+AtomicBatch::~AtomicBatch()
+{
+    // Files added but never committed: their targets stay as they are.
+    for (const Pending &file : m_files) {
+        if (file.error)
+            continue;
+        if (file.fd >= 0)
+            ::close(file.fd);
+        ::unlink(file.temporary.constData());
     }
-    // Temporary files of this target that an interrupted write left behind.
-    const QDir dir(info.absolutePath());
-    const QString prefix = QLatin1Char('.') + info.fileName() + QLatin1String(".ftpconfig-");
-    for (const QString &stale : dir.entryList({prefix + QLatin1Char('*')}, QDir::Files | QDir::Hidden | QDir::System)) {
-        if (stale.size() == prefix.size() + 6)
-            QFile::remove(dir.filePath(stale));
+}
+
+std::optional<QString> AtomicBatch::add(const QString &path, const QByteArray &content, mode_t newFileMode,
+                                        const QString &trustedTop)
+{
+    if (m_open == MaxOpenFiles)
+        syncOpenFiles();
+    m_files.emplace_back();
+    Pending &file = m_files.back();
+    prepare(file, path, content, newFileMode, trustedTop);
+    if (file.fd >= 0)
+        ++m_open;
+    return file.error;
+}
+
+void AtomicBatch::syncOpenFiles()
+{
+    // Writeback of every file is started before the first wait, so that
+    // the disk takes them together and each fsync finds little left to do.
+    for (const Pending &file : m_files) {
+        if (file.fd >= 0)
+            ::sync_file_range(file.fd, 0, 0, SYNC_FILE_RANGE_WRITE);
     }
-    // The rename itself reaches the disk with the directory.
-    const int dirFd = ::open(directory.constData(), O_RDONLY | O_DIRECTORY);
-    if (dirFd >= 0) {
-        ::fsync(dirFd);
-        ::close(dirFd);
+    for (Pending &file : m_files) {
+        if (file.fd < 0)
+            continue;
+        if (::fsync(file.fd) != 0) {
+            discard(file, "cannot sync", errno);
+            continue;
+        }
+        const int closed = ::close(file.fd);
+        file.fd = -1;
+        if (closed != 0)
+            discard(file, "cannot close", errno);
     }
-    return std::nullopt;
+    m_open = 0;
+}
+
+std::vector<std::optional<QString>> AtomicBatch::commit()
+{
+    // Every new content is on the disk before any target is replaced.
+    syncOpenFiles();
+    std::map<QString, QSet<QString>> replaced;
+    for (Pending &file : m_files) {
+        if (file.error)
+            continue;
+        if (::rename(file.temporary.constData(), file.target.constData()) != 0) {
+            discard(file, "cannot rename", errno);
+            continue;
+        }
+        const QFileInfo info(QFile::decodeName(file.target));
+        replaced[info.absolutePath()].insert(info.fileName());
+    }
+    for (const auto &[directory, names] : replaced) {
+        removeStale(directory, names);
+        // The renames reach the disk with their directory.
+        const int dirFd = ::open(QFile::encodeName(directory).constData(), O_RDONLY | O_DIRECTORY);
+        if (dirFd >= 0) {
+            ::fsync(dirFd);
+            ::close(dirFd);
+        }
+    }
+    std::vector<std::optional<QString>> results;
+    results.reserve(m_files.size());
+    for (Pending &file : m_files)
+        results.push_back(std::move(file.error));
+    m_files.clear();
+    return results;
+}
+
+std::optional<QString> writeFileAtomically(const QString &path, const QByteArray &content, mode_t newFileMode,
+                                           const QString &trustedTop)
+{
+    AtomicBatch batch;
+    if (const auto refused = batch.add(path, content, newFileMode, trustedTop))
+        return refused;
+    return batch.commit().front();
 }
 
 std::optional<QString> invalidNameReason(const QByteArray &name)

@@ -11,6 +11,8 @@
 #include <QFileInfo>
 
 #include <iostream>
+#include <utility>
+#include <vector>
 
 void FtpServerConfig::remember(const QString &key, const ConfigFile &document)
 {
@@ -23,9 +25,20 @@ bool FtpServerConfig::unchanged(const QString &key, const std::string &printed) 
     return it != m_loadedText.end() && it->second == printed;
 }
 
+namespace {
+
+// Links are followed only through directories root alone may change, up to
+// the root directory the program works in.
+QString trustedTop(const RootDirectory &root)
+{
+    return root.isSystemRoot() ? QStringLiteral("/") : root.path();
+}
+
+} // namespace
+
 std::optional<QString> FtpServerConfig::writeFile(const QString &file, const QByteArray &content)
 {
-    return writeFileAtomically(file, content, 0644, m_root.isSystemRoot() ? QStringLiteral("/") : m_root.path());
+    return writeFileAtomically(file, content, 0644, trustedTop(m_root));
 }
 
 void FtpServerConfig::reportUnsaved(const QString &shown, const QString &reason)
@@ -78,9 +91,14 @@ bool FtpServerConfig::saveUserConfigs()
         std::cerr << "Unable to create userconf dir: " << m_userConfigDir.constData() << std::endl;
         ok = false;
     }
+    // Written together: synced as one batch and their directory once,
+    // rather than two waits for the disk for each file, with every file
+    // still old or new after a crash.
+    AtomicBatch batch;
+    std::vector<std::pair<QString, std::string>> written; // shown path, printed text
     for (const auto &[user, document] : m_userConfigs) {
         const QString shown = text(m_userConfigDir + user);
-        const std::string printed = document->text();
+        std::string printed = document->text();
         if (unchanged(shown, printed))
             continue;
         // The program has always ended these files with an empty line; one
@@ -94,12 +112,18 @@ bool FtpServerConfig::saveUserConfigs()
                                        + tr("\"%1\" cannot be a file name: %2.").arg(text(user), *reason));
             continue;
         }
-        if (const auto error = writeFile(resolved(m_userConfigDir + user), content)) {
-            reportUnsaved(shown, *error);
+        // A refused file comes back from commit() in its place.
+        batch.add(resolved(m_userConfigDir + user), content, 0644, trustedTop(m_root));
+        written.emplace_back(shown, std::move(printed));
+    }
+    const auto results = batch.commit();
+    for (std::size_t i = 0; i < written.size(); ++i) {
+        if (results[i]) {
+            reportUnsaved(written[i].first, *results[i]);
             ok = false;
-            continue;
+        } else {
+            m_loadedText[written[i].first] = std::move(written[i].second);
         }
-        remember(shown, *document);
     }
     return ok;
 }

@@ -66,6 +66,7 @@ private slots:
     void writerFollowsOnlyRootsLinks_data();
     void writerFollowsOnlyRootsLinks();
     void writerRefusesDirectories();
+    void batchReportsEachFile();
     void hiddenFilesAreNoUsers();
     void serverReadsTheProgramsUserlist();
 };
@@ -359,6 +360,51 @@ void TestSave::writerRefusesDirectories()
     QVERIFY(writeFileAtomically(root.filePath(QStringLiteral("/missing/dir/file")), "x")
                 .value_or(QString())
                 .startsWith(QStringLiteral("cannot create a temporary file")));
+}
+
+void TestSave::batchReportsEachFile()
+{
+    // More files than the batch keeps open at once, one refused among them.
+    FixtureRoot root;
+    QVERIFY(root.makeDirectory(QStringLiteral("/etc/many/dir")));
+    const QString dir = root.filePath(QStringLiteral("/etc/many"));
+    AtomicBatch batch;
+    for (int i = 0; i < 300; ++i)
+        QVERIFY(!batch.add(dir + QStringLiteral("/f%1").arg(i), QByteArray::number(i)));
+    QVERIFY(batch.add(dir + QStringLiteral("/dir"), "x"));
+    QVERIFY(!batch.add(dir + QStringLiteral("/last"), "last"));
+    const auto results = batch.commit();
+    QCOMPARE(results.size(), std::size_t(302));
+    QVERIFY(results[300].value_or(QString()).startsWith(QStringLiteral("the target is a directory")));
+    QVERIFY(!results[299] && !results[301]);
+    QCOMPARE(root.readFile(QStringLiteral("/etc/many/f299")), QByteArray("299"));
+    QCOMPARE(QDir(dir).entryList(QDir::Files | QDir::Hidden).size(), 301);
+    {
+        // Dropped without a commit: nothing is written, nothing left behind.
+        AtomicBatch dropped;
+        QVERIFY(!dropped.add(dir + QStringLiteral("/f0"), "dropped"));
+    }
+    QCOMPARE(root.readFile(QStringLiteral("/etc/many/f0")), QByteArray("0"));
+    QCOMPARE(QDir(dir).entryList(QDir::Files | QDir::Hidden).size(), 301);
+
+    // A per-user file that cannot be written is reported alone; the others
+    // are saved all the same.
+    EngineFixture engine;
+    QVERIFY(engine.load(richFiles()));
+    const QString bob = engine.root.filePath(QStringLiteral("/etc/vsftpd.d/users.d/bob"));
+    QVERIFY(engine.root.writeFile(QStringLiteral("/srv/bob.conf"), "local_root=/srv/bob\n"));
+    QVERIFY(QFile::remove(bob));
+    QVERIFY(QFile::link(engine.root.filePath(QStringLiteral("/srv/bob.conf")), bob));
+    QCOMPARE(::lchown(QFile::encodeName(bob).constData(), 1000, 1000), 0);
+    CaptureStream out(std::cout);
+    QVERIFY(engine.config->setUserRoot("bob", "/srv/elsewhere"));
+    QVERIFY(engine.config->setUserRights("alice", QStringLiteral("write, download")));
+    QVERIFY(!engine.config->save());
+    QCOMPARE(engine.interaction.records.size(), 1);
+    QCOMPARE(engine.interaction.records[0].message.text, QStringLiteral("Unable to save /etc/vsftpd.d/users.d/bob"));
+    QVERIFY(engine.interaction.records[0].message.detailedText.contains(QStringLiteral("link")));
+    QCOMPARE(engine.root.readFile(QStringLiteral("/srv/bob.conf")), QByteArray("local_root=/srv/bob\n"));
+    QVERIFY(engine.root.readFile(QStringLiteral("/etc/vsftpd.d/users.d/alice")).contains("write_enable"));
 }
 
 void TestSave::hiddenFilesAreNoUsers()
