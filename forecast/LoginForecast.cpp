@@ -211,12 +211,13 @@ const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
                 m_userFileNames.reset();
             }
         }
+        // A directory that cannot be listed is tried name by name; a name it
+        // does not hold has no file, and nothing to remember.
+        if (m_userFileNames && !login.contains('/') && !m_userFileNames->contains(login))
+            return nullptr;
         std::unique_ptr<VsftpdSettings> settings;
         const QString path = m_config.root().resolve(text(directory + login));
-        std::ifstream in;
-        // A directory that cannot be listed is tried name by name.
-        if (!m_userFileNames || login.contains('/') || m_userFileNames->contains(login))
-            in.open(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
+        std::ifstream in(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
         if (in.is_open() && QFileInfo(path).isFile()) {
             ConfigFile file(SyntaxMode::KeyValue);
             file.parse(in);

@@ -99,8 +99,11 @@ void FtpServerConfig::setYes(const QByteArray &key)
 
 bool FtpServerConfig::isAnonymousUser(const QByteArray &user) const
 {
-    const AppStrings &strings = AppStrings::instance();
-    return user == strings.anonymousUsers.toLocal8Bit() || user == strings.anonymousWord.toLocal8Bit() || user == "ftp";
+    // The names never change while the program runs: converted once, not
+    // for every user of every check.
+    static const QByteArray row = AppStrings::instance().anonymousUsers.toLocal8Bit();
+    static const QByteArray word = AppStrings::instance().anonymousWord.toLocal8Bit();
+    return user == row || user == word || user == "ftp";
 }
 
 bool FtpServerConfig::isVirtualUser(const QByteArray &user) const

@@ -8,6 +8,7 @@
 #include <QJsonObject>
 
 #include <algorithm>
+#include <functional>
 #include <iostream>
 
 void ReportInteraction::show(const Message &message)
@@ -199,7 +200,11 @@ void appendFindings(QByteArray &out, const QList<ForecastFinding> &findings)
 
 } // namespace
 
-QByteArray reportJson(const Report &report, const QString &root)
+namespace {
+
+// Hands the text on in pieces of about a megabyte: the whole of it would
+// be as large again as the rows it comes from.
+void writeJson(const Report &report, const QString &root, const std::function<void(const QByteArray &)> &write)
 {
     // The document is printed without its users, and the users one by one
     // into its place, in the layout and key order QJsonDocument gives them:
@@ -238,6 +243,26 @@ QByteArray reportJson(const Report &report, const QString &root)
         out += ",\n            \"status\": ";
         appendJsonString(out, row.allowed ? strings.allowed : strings.denied);
         out += i + 1 < report.rows.size() ? "\n        },\n" : "\n        }\n";
+        if (out.size() > (1 << 20)) {
+            write(out);
+            out.clear();
+        }
     }
-    return out + framed.mid(placeholder + 10);
+    write(out + framed.mid(placeholder + 10));
+}
+
+} // namespace
+
+QByteArray reportJson(const Report &report, const QString &root)
+{
+    QByteArray text;
+    writeJson(report, root, [&](const QByteArray &piece) { text += piece; });
+    return text;
+}
+
+void printReportJson(const Report &report, const QString &root, std::FILE *out)
+{
+    writeJson(report, root, [&](const QByteArray &piece) {
+        std::fwrite(piece.constData(), 1, static_cast<size_t>(piece.size()), out);
+    });
 }

@@ -8,6 +8,8 @@
 #include <QList>
 #include <QString>
 
+#include <cstdio>
+
 class FtpServerConfig;
 
 // One row of the users table as the report prints it.
@@ -50,5 +52,7 @@ public:
 Report buildReport(FtpServerConfig &config, ReportInteraction &interaction);
 QByteArray reportText(const Report &report);
 QByteArray reportJson(const Report &report, const QString &root);
+// The same JSON written to the stream as it is made.
+void printReportJson(const Report &report, const QString &root, std::FILE *out);
 // "file:line: message", the parts that are known.
 QString findingText(const ForecastFinding &finding);

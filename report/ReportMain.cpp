@@ -72,8 +72,12 @@ int main(int argc, char **argv)
         }
         const Report report = buildReport(config, interaction);
         std::cout.rdbuf(out);
-        const QByteArray text = json ? reportJson(report, root.path()) : reportText(report);
-        std::fwrite(text.constData(), 1, static_cast<size_t>(text.size()), stdout);
+        if (json) {
+            printReportJson(report, root.path(), stdout);
+        } else {
+            const QByteArray text = reportText(report);
+            std::fwrite(text.constData(), 1, static_cast<size_t>(text.size()), stdout);
+        }
     } catch (const ProcessExit &exit) {
         return exit.status & 0xff;
     } catch (const std::exception &e) {

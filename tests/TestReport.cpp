@@ -72,6 +72,8 @@ private slots:
     void runs_data();
     void runs();
     void table();
+    void serverFindingsOnce_data();
+    void serverFindingsOnce();
     void hostileFiles_data();
     void hostileFiles();
 };
@@ -162,6 +164,56 @@ void TestReport::table()
     }
     // One line per account, the anonymous row, the header and the final newline.
     QCOMPARE(lines.size(), 8 + 1 + 1 + 1);
+}
+
+void TestReport::serverFindingsOnce_data()
+{
+    QTest::addColumn<QByteArray>("config");
+    QTest::addColumn<bool>("fails");
+    QTest::newRow("failing server") << QByteArray("listen=YES\nlisten_ipv6=YES\nlocal_enable=YES\n") << true;
+    QTest::newRow("repeated key") << QByteArray(
+        "listen=YES\nlocal_enable=YES\nnopriv_user=ftp\nsecure_chroot_dir=/srv/ftp\n"
+        "write_enable=YES\nwrite_enable=NO\n")
+                                  << false;
+}
+
+void TestReport::serverFindingsOnce()
+{
+    QFETCH(QByteArray, config);
+    QFETCH(bool, fails);
+    FixtureRoot root;
+    QVERIFY(root.write({{QStringLiteral("/etc/vsftpd.conf"), config}}));
+    const ProcessResult json = report({QStringLiteral("--root"), root.path(), QStringLiteral("--json")});
+    const ProcessResult text = report({QStringLiteral("--root"), root.path()});
+    QCOMPARE(json.exitCode, 0);
+    QCOMPARE(text.exitCode, 0);
+    const QJsonObject server = QJsonDocument::fromJson(json.out).object().value(QLatin1String("server")).toObject();
+    QCOMPARE(server.value(QLatin1String("fails")).toBool(), fails);
+    const QJsonArray findings = server.value(QLatin1String("findings")).toArray();
+    QVERIFY(!findings.isEmpty());
+    // Written once at the top, in no user's row; a user without a finding of
+    // its own shows the first of them in the table.
+    int rows = 0;
+    for (const QJsonValue &user : QJsonDocument::fromJson(json.out).object().value(QLatin1String("users")).toArray()) {
+        const QJsonArray own = user[QLatin1String("forecast")][QLatin1String("findings")].toArray();
+        for (const QJsonValue &finding : own)
+            QVERIFY2(!findings.contains(finding), qPrintable(user[QLatin1String("name")].toString()));
+        if (fails)
+            QCOMPARE(own.size(), 0);
+        ++rows;
+    }
+    QCOMPARE(rows, 8 + 1);
+    const QJsonObject first = findings.first().toObject();
+    const QByteArray said = QStringLiteral("%1:%2: %3")
+                                .arg(first[QLatin1String("file")].toString())
+                                .arg(first[QLatin1String("line")].toInt())
+                                .arg(first[QLatin1String("message")].toString())
+                                .toUtf8();
+    const QList<QByteArray> lines = text.out.split('\n');
+    const auto anonymous = std::find_if(lines.begin(), lines.end(),
+                                        [](const QByteArray &l) { return l.startsWith("Anonymous users "); });
+    QVERIFY(anonymous != lines.end());
+    QVERIFY2(anonymous->endsWith(said), anonymous->constData());
 }
 
 void TestReport::hostileFiles_data()
