@@ -178,6 +178,13 @@ QList<PamForecast::Line> PamForecast::stack(const QByteArray &facility)
     if (it == m_stacks.end()) {
         QList<Line> lines;
         expand(m_serviceFile, QStringLiteral("/etc/pam.d/") + m_service, facility, lines, 0);
+        for (Line &line : lines) {
+            for (int code = 0; code < CodeCount; ++code) {
+                const ParsedAction action
+                    = parseAction(line.actions.value(CodeNames[code], line.actions.value("default", "bad")));
+                line.parsedActions[static_cast<size_t>(code)] = {static_cast<int>(action.action), action.jump};
+            }
+        }
         it = m_stacks.emplace(facility, lines).first;
     }
     return it->second;
@@ -465,9 +472,8 @@ PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const
                 return {Outcome::Unknown, line.file, line.line,
                         QStringLiteral("the outcome depends on %1").arg(answer->reason)};
             }
-            const QByteArray name = CodeNames[*code];
-            QByteArray actionText = line.actions.value(name, line.actions.value("default", "bad"));
-            const ParsedAction action = parseAction(actionText);
+            const auto &parsed = line.parsedActions[static_cast<size_t>(*code)];
+            const ParsedAction action{static_cast<Action>(parsed.first), parsed.second};
             const QString reason = answer->code ? answer->reason : QString();
             const auto fail = [&]() {
                 if (state.impression != State::Negative) {

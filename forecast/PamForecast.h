@@ -10,6 +10,7 @@
 #include <QSet>
 #include <QString>
 
+#include <array>
 #include <functional>
 #include <map>
 #include <optional>
@@ -64,6 +65,9 @@ private:
         QByteArray module; // the file name of the module, "pam_unix.so"
         QList<QByteArray> args; // after the module
         QHash<QByteArray, QByteArray> actions; // value -> action, "default" included
+        // The action each code leads to (its kind and the jump of "N"),
+        // parsed once when the stack is built rather than for every user.
+        std::array<std::pair<int, int>, CodeCount> parsedActions{};
         QString file;
         int line = 0;
     };

@@ -86,7 +86,9 @@ QByteArray FtpServerConfig::value(const QByteArray &key, const QByteArray &defau
 
 bool FtpServerConfig::isYes(const QByteArray &key, bool absentMeansYes) const
 {
-    return value(key, absentMeansYes ? "yes" : "no").toLower() == "yes";
+    // Compared in place: this runs several times for every user.
+    const std::optional<QByteArray> found = mainValue(key);
+    return found ? found->compare("yes", Qt::CaseInsensitive) == 0 : absentMeansYes;
 }
 
 void FtpServerConfig::setYes(const QByteArray &key)
