@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <functional>
 #include <iostream>
+#include <vector>
 
 void ReportInteraction::show(const Message &message)
 {
@@ -124,32 +125,47 @@ QByteArray reportText(const Report &report)
             break;
         }
     }
-    QList<QStringList> table{header};
+    // The cells of every line first, since their widths make the columns;
+    // then each line is padded in one reused buffer.
+    const int columns = header.size();
+    std::vector<QString> cells(header.begin(), header.end());
+    cells.reserve(static_cast<size_t>((rows.size() + 1) * columns));
     const AppStrings &strings = AppStrings::instance();
+    const QString none = QStringLiteral("-");
     for (const ReportRow &row : rows) {
         const bool failed = !row.failure.message.isEmpty();
-        const QString said = row.forecast.findings.isEmpty() ? serverSays : findingText(row.forecast.findings.first());
-        table.append({QString::fromUtf8(row.name), row.kind, row.allowed ? strings.allowed : strings.denied,
-                      forecastStatusText(row.forecast.status), QString::fromUtf8(row.directory),
-                      row.rights.isEmpty() ? QStringLiteral("-") : row.rights,
-                      failed ? failureKindText(row.failure.kind) : QStringLiteral("-"),
-                      failed ? row.failure.message : QStringLiteral("-"), said});
+        cells.push_back(QString::fromUtf8(row.name));
+        cells.push_back(row.kind);
+        cells.push_back(row.allowed ? strings.allowed : strings.denied);
+        cells.push_back(forecastStatusText(row.forecast.status));
+        cells.push_back(QString::fromUtf8(row.directory));
+        cells.push_back(row.rights.isEmpty() ? none : row.rights);
+        cells.push_back(failed ? failureKindText(row.failure.kind) : none);
+        cells.push_back(failed ? row.failure.message : none);
+        cells.push_back(row.forecast.findings.isEmpty() ? serverSays : findingText(row.forecast.findings.first()));
     }
-    QVector<int> widths(header.size(), 0);
-    for (const QStringList &line : table)
-        for (int i = 0; i < line.size(); ++i)
-            widths[i] = std::max(widths[i], static_cast<int>(line[i].size()));
+    QVector<int> widths(columns, 0);
+    for (size_t i = 0; i < cells.size(); ++i) {
+        int &width = widths[static_cast<int>(i % static_cast<size_t>(columns))];
+        width = std::max(width, static_cast<int>(cells[i].size()));
+    }
     QByteArray out;
     for (const ForecastFinding &finding : report.serverFindings) {
         out += QStringLiteral("server %1: %2\n").arg(severityText(finding.severity), findingText(finding)).toUtf8();
     }
     if (!report.serverFindings.isEmpty())
         out += '\n';
-    for (const QStringList &line : table) {
-        QString text;
-        for (int i = 0; i < line.size(); ++i)
-            text += i + 1 < line.size() ? line[i].leftJustified(widths[i] + 2) : line[i];
-        out += text.trimmed().toUtf8() + '\n';
+    QString line;
+    for (size_t first = 0; first < cells.size(); first += static_cast<size_t>(columns)) {
+        line.clear();
+        for (int i = 0; i < columns; ++i) {
+            const QString &cell = cells[first + static_cast<size_t>(i)];
+            line += cell;
+            if (i + 1 < columns && cell.size() < widths[i] + 2)
+                line.resize(line.size() + widths[i] + 2 - cell.size(), QLatin1Char(' '));
+        }
+        out += QStringView(line).trimmed().toUtf8();
+        out += '\n';
     }
     return out;
 }
