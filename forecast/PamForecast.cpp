@@ -62,8 +62,9 @@ QByteArray baseName(const QByteArray &module)
 
 QByteArray argument(const QList<QByteArray> &args, const QByteArray &name)
 {
+    // Compared in place: this runs for every user and line.
     for (const QByteArray &arg : args) {
-        if (arg.startsWith(name + '='))
+        if (arg.size() > name.size() && arg.startsWith(name) && arg.at(name.size()) == '=')
             return arg.mid(name.size() + 1);
     }
     return {};
