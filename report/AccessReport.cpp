@@ -108,9 +108,8 @@ QJsonArray findingsJson(const QList<ForecastFinding> &findings)
     return array;
 }
 
-} // namespace
-
-QByteArray reportText(const Report &report)
+// Hands the table on in pieces of about a megabyte, like the JSON.
+void writeText(const Report &report, const std::function<void(const QByteArray &)> &write)
 {
     const QList<ReportRow> &rows = report.rows;
     const QStringList header{QStringLiteral("USER"),   QStringLiteral("KIND"),      QStringLiteral("STATUS"),
@@ -166,8 +165,28 @@ QByteArray reportText(const Report &report)
         }
         out += QStringView(line).trimmed().toUtf8();
         out += '\n';
+        if (out.size() > (1 << 20)) {
+            write(out);
+            out.clear();
+        }
     }
-    return out;
+    write(out);
+}
+
+} // namespace
+
+QByteArray reportText(const Report &report)
+{
+    QByteArray text;
+    writeText(report, [&](const QByteArray &piece) { text += piece; });
+    return text;
+}
+
+void printReportText(const Report &report, std::FILE *out)
+{
+    writeText(report, [&](const QByteArray &piece) {
+        std::fwrite(piece.constData(), 1, static_cast<size_t>(piece.size()), out);
+    });
 }
 
 namespace {

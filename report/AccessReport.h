@@ -51,6 +51,8 @@ public:
 // verdict of checkAccess without repair and the forecast beside it.
 Report buildReport(FtpServerConfig &config, ReportInteraction &interaction);
 QByteArray reportText(const Report &report);
+// The same table written to the stream as it is made.
+void printReportText(const Report &report, std::FILE *out);
 QByteArray reportJson(const Report &report, const QString &root);
 // The same JSON written to the stream as it is made.
 void printReportJson(const Report &report, const QString &root, std::FILE *out);

@@ -73,12 +73,10 @@ int main(int argc, char **argv)
         }
         const Report report = buildReport(config, interaction);
         std::cout.rdbuf(out);
-        if (json) {
+        if (json)
             printReportJson(report, root.path(), stdout);
-        } else {
-            const QByteArray text = reportText(report);
-            std::fwrite(text.constData(), 1, static_cast<size_t>(text.size()), stdout);
-        }
+        else
+            printReportText(report, stdout);
         // Everything is said: taking apart the rows, the accounts and the
         // virtual users one allocation at a time would only make the
         // program slower to end (7% of a run with 110,000 users).
