@@ -318,6 +318,7 @@ void CMainWindow::toggleAllowedUsers(bool hide)
 void CMainWindow::refilterKeepingCurrent(void (CUsersFilterProxyModel::*setHidden)(bool), bool hide)
 {
     const QPersistentModelIndex current = currentSourceIndex();
+    m_model->evaluateAll();
     (m_proxy->*setHidden)(hide);
     m_view->expandAll();
     m_view->setCurrentIndex(m_proxy->mapFromSource(current));

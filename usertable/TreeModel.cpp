@@ -108,6 +108,19 @@ void TreeModel::evaluateSome()
     // their own while the engine is half-way through a repair.
     if (m_editing || QApplication::activeModalWidget())
         return;
+    evaluatePending(8);
+}
+
+void TreeModel::evaluateAll()
+{
+    if (m_evaluator.isActive())
+        evaluatePending(-1);
+}
+
+void TreeModel::evaluatePending(qint64 milliseconds)
+{
+    // Files and settings read once for all the users of the slice.
+    const FtpServerConfig::MetadataPass pass(*m_config);
     QElapsedTimer slice;
     slice.start();
     const Item *groups[] = {m_localUsers, m_virtualUsers};
@@ -119,7 +132,7 @@ void TreeModel::evaluateSome()
             continue;
         }
         compute(*children[m_pendingRow++]);
-        if ((m_pendingRow & 63) == 0 && slice.elapsed() >= 8)
+        if (milliseconds >= 0 && (m_pendingRow & 63) == 0 && slice.elapsed() >= milliseconds)
             return;
     }
     m_evaluator.stop();

@@ -55,6 +55,8 @@ public:
     bool hasUnsavedChanges() const;
     void setUnsavedChanges(bool unsaved);
 
+    // Every verdict not yet made, at once (a filter by status needs them all).
+    void evaluateAll();
     // Discards the rows and builds them again from the engine, in a reset.
     void rebuild();
     // Removes the virtual user of the row from the database (in memory,
@@ -99,6 +101,8 @@ private:
     // Makes every user's verdict ready in idle time, a slice at a time.
     void evaluateLater();
     void evaluateSome();
+    // Until done, or for about the given time when not negative.
+    void evaluatePending(qint64 milliseconds);
     void markChanged();
     void invalidData(const QString &reason);
     bool setStatus(Item &item, bool allowed);
