@@ -64,6 +64,15 @@ QString severityText(ForecastFinding::Severity severity)
     return QStringLiteral("info");
 }
 
+QString findingText(const ForecastFinding &finding)
+{
+    QString out;
+    if (!finding.file.isEmpty())
+        out += finding.file + (finding.line > 0 ? QStringLiteral(":%1").arg(finding.line) : QString())
+            + QStringLiteral(": ");
+    return out + finding.message;
+}
+
 LoginForecast::LoginForecast(FtpServerConfig &config, QDate today)
     : m_config(config)
     , m_today(today)

@@ -89,3 +89,5 @@ private:
 
 QString forecastStatusText(ForecastStatus status);
 QString severityText(ForecastFinding::Severity severity);
+// "file:line: message", the parts that are known.
+QString findingText(const ForecastFinding &finding);

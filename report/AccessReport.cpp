@@ -85,15 +85,6 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
     return report;
 }
 
-QString findingText(const ForecastFinding &finding)
-{
-    QString out;
-    if (!finding.file.isEmpty())
-        out += finding.file + (finding.line > 0 ? QStringLiteral(":%1").arg(finding.line) : QString())
-            + QStringLiteral(": ");
-    return out + finding.message;
-}
-
 namespace {
 
 QJsonArray findingsJson(const QList<ForecastFinding> &findings)

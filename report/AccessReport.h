@@ -56,5 +56,3 @@ void printReportText(const Report &report, std::FILE *out);
 QByteArray reportJson(const Report &report, const QString &root);
 // The same JSON written to the stream as it is made.
 void printReportJson(const Report &report, const QString &root, std::FILE *out);
-// "file:line: message", the parts that are known.
-QString findingText(const ForecastFinding &finding);

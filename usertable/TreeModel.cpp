@@ -249,11 +249,7 @@ QVariant TreeModel::data(const QModelIndex &index, int role) const
             const UserForecast &forecast = forecastOf(item);
             if (forecast.findings.isEmpty())
                 return forecastStatusText(forecast.status);
-            const ForecastFinding &first = forecast.findings.first();
-            QString where = first.file;
-            if (!where.isEmpty() && first.line > 0)
-                where += QLatin1Char(':') + QString::number(first.line);
-            return where.isEmpty() ? first.message : where + QStringLiteral(": ") + first.message;
+            return findingText(forecast.findings.first());
         }
         return {};
     }
