@@ -110,25 +110,30 @@ void AccountStore::buildIndexes()
         if (!m_groupIds.contains(group.name))
             m_groupIds.insert(group.name, gid);
     }
+    m_passwdIndex.reserve(static_cast<int>(m_passwd.size()));
     for (const auto &[name, record] : m_passwd) {
         if (!m_userNames.contains(record.uid))
             m_userNames.insert(record.uid, name);
+        m_passwdIndex.insert(name, &record);
     }
+    m_shadowIndex.reserve(static_cast<int>(m_shadow.size()));
+    for (const auto &[name, record] : m_shadow)
+        m_shadowIndex.insert(name, &record);
 }
 
 bool AccountStore::getUserInfo(const QByteArray &name, AccountRecord &record) const
 {
-    const auto it = m_passwd.find(name);
-    if (it == m_passwd.end())
+    const AccountRecord *found = m_passwdIndex.value(name);
+    if (!found)
         return false;
-    record = it->second;
+    record = *found;
     return true;
 }
 
 QByteArray AccountStore::shadowPassword(const QByteArray &name) const
 {
-    const auto it = m_shadow.find(name);
-    return it == m_shadow.end() ? QByteArray() : it->second.password;
+    const AccountRecord *found = m_shadowIndex.value(name);
+    return found ? found->password : QByteArray();
 }
 
 uint32_t AccountStore::firstUserId() const
@@ -162,9 +167,9 @@ bool AccountStore::isSystemUser(const QByteArray &name) const
 
 bool AccountStore::isBadPassword(const QByteArray &name) const
 {
-    for (const auto *map : {&m_passwd, &m_shadow}) {
-        const auto it = map->find(name);
-        if (it != map->end() && (it->second.password == "!" || it->second.password == "*"))
+    for (const auto *index : {&m_passwdIndex, &m_shadowIndex}) {
+        const AccountRecord *found = index->value(name);
+        if (found && (found->password == "!" || found->password == "*"))
             return true;
     }
     return false;
@@ -173,13 +178,12 @@ bool AccountStore::isBadPassword(const QByteArray &name) const
 QList<QByteArray> AccountStore::userGroups(const QByteArray &name) const
 {
     QList<QByteArray> result = m_supplementaryGroups.value(name);
-    const auto account = m_passwd.find(name);
-    if (account == m_passwd.end())
+    const AccountRecord *account = m_passwdIndex.value(name);
+    if (!account)
         return result;
-    const auto primary = m_groups.find(account->second.gid);
+    const auto primary = m_groups.find(account->gid);
     if (primary == m_groups.end()) {
-        std::cerr << "Warning: user has gid=" << account->second.gid << ", but such group could not be found"
-                  << std::endl;
+        std::cerr << "Warning: user has gid=" << account->gid << ", but such group could not be found" << std::endl;
         return result;
     }
     result.append(primary->second.name);
@@ -226,20 +230,28 @@ void AccountStore::loadVirtualUsers(const QByteArray &path)
     if (!m_db)
         m_db = std::make_unique<VirtualUserDb>(m_databasePath, m_root, m_access);
     m_virtualUsers.clear();
-    for (auto &[name, password] : m_db->readAll())
+    m_virtualNames.clear();
+    m_virtualUsersChanged = false;
+    auto records = m_db->readAll();
+    m_virtualNames.reserve(static_cast<int>(records.size()));
+    for (auto &[name, password] : records) {
         m_virtualUsers.emplace(name, VirtualUserRecord{password, {}, VirtualUserState::Unchanged});
+        m_virtualNames.insert(name);
+    }
 }
 
 bool AccountStore::isVirtualUser(const QByteArray &name) const
 {
-    return m_virtualUsers.count(name) > 0;
+    return m_virtualNames.contains(name);
 }
 
 void AccountStore::addVirtualUser(const QByteArray &name, const QByteArray &password)
 {
+    m_virtualUsersChanged = true;
     const auto it = m_virtualUsers.find(name);
     if (it == m_virtualUsers.end()) {
         m_virtualUsers.emplace(name, VirtualUserRecord{password, {}, VirtualUserState::Added});
+        m_virtualNames.insert(name);
     } else if (it->second.state == VirtualUserState::Deleted) {
         it->second.password = password;
         it->second.state = VirtualUserState::Added;
@@ -251,6 +263,7 @@ void AccountStore::changeVirtualUser(const QByteArray &oldName, const QByteArray
     const auto it = m_virtualUsers.find(oldName);
     if (it == m_virtualUsers.end())
         return;
+    m_virtualUsersChanged = true;
     VirtualUserRecord &record = it->second;
     if (!password.isEmpty() && password != record.password) {
         record.password = password;
@@ -265,14 +278,18 @@ void AccountStore::changeVirtualUser(const QByteArray &oldName, const QByteArray
         record.previousName = oldName;
     const VirtualUserRecord moved = record;
     m_virtualUsers.erase(it);
+    m_virtualNames.remove(oldName);
     m_virtualUsers[newName] = moved;
+    m_virtualNames.insert(newName);
 }
 
 void AccountStore::removeVirtualUser(const QByteArray &name)
 {
     const auto it = m_virtualUsers.find(name);
-    if (it != m_virtualUsers.end())
+    if (it != m_virtualUsers.end()) {
         it->second.state = VirtualUserState::Deleted;
+        m_virtualUsersChanged = true;
+    }
 }
 
 void AccountStore::syncVirtualUsers()
@@ -327,6 +344,16 @@ void AccountStore::saveVirtualUsers()
 const std::map<QByteArray, VirtualUserRecord> &AccountStore::virtualUsers() const
 {
     return m_virtualUsers;
+}
+
+bool AccountStore::virtualUsersChanged() const
+{
+    return m_virtualUsersChanged;
+}
+
+const QSet<QByteArray> &AccountStore::virtualUserKeys() const
+{
+    return m_virtualNames;
 }
 
 const QByteArray &AccountStore::databasePath() const

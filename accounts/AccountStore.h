@@ -6,6 +6,7 @@
 #include <QByteArray>
 #include <QHash>
 #include <QList>
+#include <QSet>
 #include <QString>
 
 #include <cstdint>
@@ -78,6 +79,10 @@ public:
     void saveVirtualUsers();
 
     const std::map<QByteArray, VirtualUserRecord> &virtualUsers() const;
+    // Some virtual user added, changed or deleted since the database was read.
+    bool virtualUsersChanged() const;
+    // The keys of virtualUsers(), deleted ones included.
+    const QSet<QByteArray> &virtualUserKeys() const;
     const QByteArray &databasePath() const;
     VirtualUserDb *database() const;
 
@@ -101,7 +106,14 @@ private:
     QHash<QByteArray, QList<QByteArray>> m_supplementaryGroups; // in gid order
     QHash<QByteArray, uint32_t> m_groupIds;
     QHash<uint32_t, QByteArray> m_userNames;
+    // Every row of the table looks its name up here several times; a hash
+    // beside the ordered maps keeps that off the tree walks. The maps never
+    // change after loading, so the pointers stay valid.
+    QHash<QByteArray, const AccountRecord *> m_passwdIndex;
+    QHash<QByteArray, const AccountRecord *> m_shadowIndex;
     std::map<QByteArray, VirtualUserRecord> m_virtualUsers;
+    QSet<QByteArray> m_virtualNames; // the keys of m_virtualUsers
+    bool m_virtualUsersChanged = false;
     QByteArray m_databasePath;
     std::unique_ptr<VirtualUserDb> m_db;
 };

@@ -355,6 +355,11 @@ const QHash<QByteArray, int> *PamForecast::listEntries(const QByteArray &file)
 
 const QSet<QByteArray> *PamForecast::userdbKeys(const QByteArray &path)
 {
+    // The database the account store has read, untouched since, is the one
+    // pam_userdb would open: its names are not read a second time.
+    const VirtualUserDb *stored = m_accounts.database();
+    if (stored && stored->isOpen() && stored->filePath() == path && !m_accounts.virtualUsersChanged())
+        return &m_accounts.virtualUserKeys();
     auto it = m_userdbs.find(path);
     if (it == m_userdbs.end()) {
         std::optional<QSet<QByteArray>> keys;

@@ -229,14 +229,14 @@ void VsftpdSettings::readLine(const QByteArray &key, const QByteArray &value, in
                              .arg(shown(key), shown(value))});
         return;
     }
-    const auto it = m_settings.find(key);
-    if (it != m_settings.end() && it->second.value != value) {
+    const auto it = m_settings.constFind(key);
+    if (it != m_settings.constEnd() && it->value != value) {
         m_repeats.append({line,
                           QStringLiteral("%1 is set again here (first on line %2): vsftpd uses this last "
                                          "value, \"%3\"; this program's verdict reads the first, \"%4\"")
                               .arg(shown(key))
-                              .arg(it->second.line)
-                              .arg(shown(value), shown(it->second.value))});
+                              .arg(it->line)
+                              .arg(shown(value), shown(it->value))});
     }
     m_settings[key] = {value, line};
 }
@@ -264,13 +264,13 @@ const QList<VsftpdSettings::Problem> &VsftpdSettings::repeats() const
 
 bool VsftpdSettings::contains(const QByteArray &key) const
 {
-    return m_settings.count(key) > 0;
+    return m_settings.contains(key);
 }
 
 const VsftpdSettings::Setting *VsftpdSettings::find(const QByteArray &key) const
 {
-    const auto it = m_settings.find(key);
-    return it == m_settings.end() ? nullptr : &it->second;
+    const auto it = m_settings.constFind(key);
+    return it == m_settings.constEnd() ? nullptr : &it.value();
 }
 
 QByteArray VsftpdSettings::value(const QByteArray &key, const QByteArray &defaultValue) const

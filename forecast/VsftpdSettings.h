@@ -3,6 +3,7 @@
 #include "config/ConfigFile.h"
 
 #include <QByteArray>
+#include <QHash>
 #include <QList>
 #include <QString>
 
@@ -51,7 +52,8 @@ public:
 private:
     void readLine(const QByteArray &key, const QByteArray &value, int line);
 
-    std::map<QByteArray, Setting> m_settings;
+    // Looked up several times for every user of the report: hashed.
+    QHash<QByteArray, Setting> m_settings;
     QList<Problem> m_errors;
     QList<Problem> m_repeats;
 };
