@@ -320,7 +320,7 @@ void CMainWindow::refilterKeepingCurrent(void (CUsersFilterProxyModel::*setHidde
     const QPersistentModelIndex current = currentSourceIndex();
     m_model->evaluateAll();
     (m_proxy->*setHidden)(hide);
-    m_view->expandAll();
+    m_view->expandGroups();
     m_view->setCurrentIndex(m_proxy->mapFromSource(current));
 }
 

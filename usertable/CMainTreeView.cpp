@@ -15,3 +15,19 @@ void CMainTreeView::currentChanged(const QModelIndex &current, const QModelIndex
     QTreeView::currentChanged(current, previous);
     emit selected(current);
 }
+
+void CMainTreeView::expandGroups(const QModelIndex &parent)
+{
+    const QAbstractItemModel *rows = model();
+    if (!rows)
+        return;
+    const int count = rows->rowCount(parent);
+    for (int row = 0; row < count; ++row) {
+        const QModelIndex index = rows->index(row, 0, parent);
+        if (!rows->hasChildren(index))
+            continue;
+        if (!isExpanded(index))
+            expand(index);
+        expandGroups(index);
+    }
+}

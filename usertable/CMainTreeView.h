@@ -11,6 +11,11 @@ class CMainTreeView : public QTreeView
 public:
     explicit CMainTreeView(QWidget *parent = nullptr);
 
+    // Every row that has rows below it expanded: what expandAll() shows
+    // here, where only groups hold rows, without laying out every user row
+    // again when the groups are open already (a filter toggle).
+    void expandGroups(const QModelIndex &parent = QModelIndex());
+
 signals:
     void selected(const QModelIndex &index);
 

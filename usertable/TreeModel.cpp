@@ -26,9 +26,12 @@ struct TreeModel::Item
     std::vector<std::unique_ptr<Item>> children;
 
     // Filled from the engine when first shown, and again after a change.
+    // The verdict is made for every row (the filters need it); the root and
+    // rights only for the rows painted.
     bool computed = false;
     bool allowed = false;
     AccessFailure failure;
+    bool detailed = false;
     QString directory;
     QString mode;
     std::optional<UserForecast> forecast;
@@ -150,9 +153,18 @@ void TreeModel::compute(Item &item) const
     item.computed = true;
     item.failure = AccessFailure();
     item.allowed = m_config->checkAccess(item.name, false, &item.failure);
+    item.detailed = false;
+    item.forecast.reset();
+}
+
+void TreeModel::computeDetails(Item &item) const
+{
+    compute(item);
+    if (item.detailed)
+        return;
+    item.detailed = true;
     item.directory = QString::fromUtf8(m_config->configuredRoot(item.name));
     item.mode = rightsText(m_config->userRights(item.name));
-    item.forecast.reset();
 }
 
 const UserForecast &TreeModel::forecastOf(Item &item) const
@@ -223,9 +235,15 @@ QVariant TreeModel::data(const QModelIndex &index, int role) const
         case StatusColumn:
             return user ? (item.allowed ? strings.allowed : strings.denied) : QString();
         case DirectoryColumn:
-            return user ? item.directory : QString();
+            if (!user)
+                return QString();
+            computeDetails(item);
+            return item.directory;
         case ModeColumn:
-            return user ? item.mode : QString();
+            if (!user)
+                return QString();
+            computeDetails(item);
+            return item.mode;
         case ServerColumn:
             return user ? forecastStatusText(forecastOf(item).status) : QString();
         default:

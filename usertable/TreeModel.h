@@ -95,6 +95,7 @@ private:
     void buildRows();
     // The verdict, directory and rights of a user row, from the engine.
     void compute(Item &item) const;
+    void computeDetails(Item &item) const;
     const UserForecast &forecastOf(Item &item) const;
     LoginForecast &loginForecastMutable();
     void refreshAllUsers();
