@@ -1,0 +1,351 @@
+// Applies one administrator's edit through the main window's widgets and
+// saves with its Save action: the end-to-end tests use it to show that what
+// the dialogs and the status editor do reaches the real server.
+//   windowedit --root DIR vadd NAME PASSWORD
+//   windowedit --root DIR vchange OLD NEW PASSWORD
+//   windowedit --root DIR vdelete NAME
+//   windowedit --root DIR grant USER
+//   windowedit --root DIR deny USER
+// Every box and dialog is answered the way editchild answers the engine:
+// with its accepting button; each one's text goes to stderr. Prints
+// "done saved" and exits 0 when the edit took and the save reported nothing.
+#include "ModalHelper.h"
+#include "app/CMainWindow.h"
+#include "app/Server.h"
+#include "common/AppStrings.h"
+#include "dialogs/PAMDialog.h"
+#include "dialogs/SelectDirectoryOwnerDialog.h"
+#include "policy/FtpServerConfig.h"
+#include "usertable/CMainTreeView.h"
+#include "usertable/CUsersFilterProxyModel.h"
+#include "usertable/CreateVUserDialog.h"
+#include "usertable/TreeModel.h"
+
+#include <QAction>
+#include <QApplication>
+#include <QComboBox>
+#include <QDBusConnection>
+#include <QLineEdit>
+#include <QMap>
+#include <QPushButton>
+#include <QTemporaryDir>
+#include <QTest>
+
+#include <cstdio>
+#include <iostream>
+#include <memory>
+#include <optional>
+
+namespace {
+
+// What the administrator types into the virtual user dialog.
+struct Typed
+{
+    QString name;
+    QString password;
+};
+
+// Answers whatever comes up, in the order it comes, and keeps what was
+// wrong: the edit's own dialog is filled once (a second showing means the
+// dialog refused what was typed), every question gets its accepting button,
+// and a warning with nothing to choose is a refusal.
+class Answerer
+{
+public:
+    explicit Answerer(ModalHelper &modal)
+        : m_modal(modal)
+    {
+        arm();
+    }
+
+    void setTyped(const Typed &typed)
+    {
+        m_typed = typed;
+    }
+    // A refusal while saving is the save's: it failed.
+    void setSaving(bool saving)
+    {
+        m_saving = saving;
+    }
+    bool saveRefused() const
+    {
+        return m_saveRefused;
+    }
+    const QStringList &problems() const
+    {
+        return m_problems;
+    }
+
+private:
+    // One expectation at a time, re-armed by each answer: how many
+    // questions a repair asks depends on the files.
+    void arm()
+    {
+        m_modal.expect(QString(), [this](QWidget *widget) {
+            arm();
+            answer(widget);
+        });
+    }
+
+    void answer(QWidget *widget)
+    {
+        if (auto *box = qobject_cast<QMessageBox *>(widget))
+            return answerBox(box);
+        std::fprintf(stderr, "dialog: %s\n", qPrintable(widget->windowTitle()));
+        if (auto *dialog = qobject_cast<CreateVUserDialog *>(widget))
+            return fill(dialog);
+        if (auto *pam = qobject_cast<PAMDialog *>(widget)) {
+            // As editchild: the PAM configuration is taken as it is.
+            if (auto *valid = pam->findChild<QPushButton *>(QStringLiteral("valid_button")))
+                return valid->click();
+            return refuse(widget, QStringLiteral("no valid button"));
+        }
+        if (auto *owner = qobject_cast<SelectDirectoryOwnerDialog *>(widget)) {
+            auto *combo = owner->findChild<QComboBox *>(QStringLiteral("ownerComboBox"));
+            combo->setCurrentIndex(combo->findText(QStringLiteral("root")));
+        }
+        if (!ModalHelper::press(widget, QDialogButtonBox::Ok))
+            refuse(widget, QStringLiteral("no OK button"));
+    }
+
+    void answerBox(QMessageBox *box)
+    {
+        std::fprintf(stderr, "box: %s | %s | %s\n", qPrintable(box->windowTitle()), qPrintable(box->text()),
+                     qPrintable(box->informativeText()));
+        if (!box->detailedText().isEmpty())
+            std::fprintf(stderr, "     %s\n", qPrintable(box->detailedText()));
+        int answers = 0;
+        for (QAbstractButton *button : box->buttons())
+            answers += box->buttonRole(button) != QMessageBox::ActionRole; // not "Show Details..."
+        if (answers == 1 && (box->icon() == QMessageBox::Warning || box->icon() == QMessageBox::Critical)) {
+            if (m_saving)
+                m_saveRefused = true;
+            else
+                m_problems << QStringLiteral("refused: ") + box->text();
+        }
+        // The engine's own accepting button first (it carries the action's
+        // name, "Create", "Fix"), then Yes, then OK.
+        QAbstractButton *accepting = nullptr;
+        for (QAbstractButton *button : box->buttons()) {
+            if (box->buttonRole(button) == QMessageBox::AcceptRole
+                && box->standardButton(button) == QMessageBox::NoButton)
+                accepting = button;
+        }
+        for (const QMessageBox::StandardButton standard : {QMessageBox::Yes, QMessageBox::Ok}) {
+            if (!accepting)
+                accepting = box->button(standard);
+        }
+        if (!accepting)
+            return refuse(box, QStringLiteral("no accepting button"));
+        accepting->click();
+    }
+
+    void fill(CreateVUserDialog *dialog)
+    {
+        if (m_filled || !m_typed)
+            return refuse(dialog, m_filled ? QStringLiteral("shown again") : QStringLiteral("not asked for"));
+        m_filled = true;
+        // Typed key by key, as the Ok button waits for the first edit.
+        for (QLineEdit *edit : {dialog->nameLineEdit(), dialog->passwordLineEdit(), dialog->confirmationLineEdit()}) {
+            edit->selectAll();
+            QTest::keyClick(edit, Qt::Key_Delete);
+            QTest::keyClicks(edit, edit == dialog->nameLineEdit() ? m_typed->name : m_typed->password);
+        }
+        if (!ModalHelper::press(dialog, QDialogButtonBox::Ok))
+            refuse(dialog, QStringLiteral("OK not enabled"));
+    }
+
+    void refuse(QWidget *widget, const QString &why)
+    {
+        m_problems << QStringLiteral("\"%1\": %2").arg(widget->windowTitle(), why);
+        if (auto *dialog = qobject_cast<QDialog *>(widget))
+            dialog->reject();
+        else
+            widget->close();
+    }
+
+    ModalHelper &m_modal;
+    std::optional<Typed> m_typed;
+    bool m_filled = false;
+    bool m_saving = false;
+    bool m_saveRefused = false;
+    QStringList m_problems;
+};
+
+// The shown row of a user (or a group), at the column.
+QModelIndex rowOf(const CMainWindow &window, const QString &name, int column)
+{
+    const TreeModel &model = *window.model();
+    const QModelIndexList found
+        = model.match(model.index(0, 0), Qt::DisplayRole, name, 1, Qt::MatchExactly | Qt::MatchRecursive);
+    return found.isEmpty() ? QModelIndex() : window.proxy()->mapFromSource(found.first().siblingAtColumn(column));
+}
+
+// Triggers the action as the menu would: only when it is offered.
+bool trigger(const CMainWindow &window, const char *name, QStringList &problems)
+{
+    auto *action = window.findChild<QAction *>(QLatin1String(name));
+    if (!action || !action->isVisible() || !action->isEnabled()) {
+        problems << QStringLiteral("%1 is not offered").arg(QLatin1String(name));
+        return false;
+    }
+    action->trigger();
+    return true;
+}
+
+// Clicks the user's row, as the administrator does before Edit or Delete.
+bool select(const CMainWindow &window, const QString &name, QStringList &problems)
+{
+    const QModelIndex row = rowOf(window, name, TreeModel::UsersColumn);
+    if (!row.isValid()) {
+        problems << QStringLiteral("no row %1").arg(name);
+        return false;
+    }
+    window.view()->setCurrentIndex(row);
+    return true;
+}
+
+// Opens the status cell's editor and chooses the status in its combo, whose
+// choice the delegate commits at once.
+bool chooseStatus(const CMainWindow &window, const QString &user, const QString &status, QStringList &problems)
+{
+    const QModelIndex cell = rowOf(window, user, TreeModel::StatusColumn);
+    if (!cell.isValid()) {
+        problems << QStringLiteral("no row %1").arg(user);
+        return false;
+    }
+    window.view()->setCurrentIndex(cell);
+    window.view()->edit(cell);
+    auto *combo = qobject_cast<QComboBox *>(window.view()->indexWidget(cell));
+    if (!combo) {
+        problems << QStringLiteral("no status editor for %1").arg(user);
+        return false;
+    }
+    const int wanted = combo->findText(status);
+    if (wanted < 0 || combo->currentIndex() == wanted) {
+        problems << QStringLiteral("the editor of %1 opens on \"%2\"").arg(user, combo->currentText());
+        return false;
+    }
+    combo->setCurrentIndex(wanted);
+    // The administrator moves on to the next row.
+    window.view()->setCurrentIndex(rowOf(window, user, TreeModel::UsersColumn));
+    return true;
+}
+
+int usage()
+{
+    std::fputs("usage: windowedit --root DIR vadd NAME PASSWORD | vchange OLD NEW PASSWORD | vdelete NAME"
+               " | grant USER | deny USER\n",
+               stderr);
+    return 2;
+}
+
+} // namespace
+
+int main(int argc, char **argv)
+{
+    if (qEnvironmentVariableIsEmpty("QT_QPA_PLATFORM"))
+        qputenv("QT_QPA_PLATFORM", "offscreen");
+    // The window keeps its state in the settings: a directory of its own,
+    // so that nothing of this run reaches another.
+    QTemporaryDir settings;
+    qputenv("XDG_CONFIG_HOME", QFile::encodeName(settings.path()));
+    QApplication app(argc, argv);
+    QApplication::setQuitOnLastWindowClosed(false);
+    const QStringList args = QCoreApplication::arguments();
+    if (args.size() < 5 || args[1] != QLatin1String("--root") || !settings.isValid())
+        return usage();
+    qputenv("FTPCONFIG_ROOT", QFile::encodeName(args[2]));
+    const QString operation = args[3];
+    const QString user = args[4];
+    const QMap<QString, int> argumentCounts{{QStringLiteral("vadd"), 6},
+                                            {QStringLiteral("vchange"), 7},
+                                            {QStringLiteral("vdelete"), 5},
+                                            {QStringLiteral("grant"), 5},
+                                            {QStringLiteral("deny"), 5}};
+    if (args.size() != argumentCounts.value(operation))
+        return usage();
+    const bool virtualEdit = operation.startsWith(QLatin1Char('v'));
+
+    // Nothing on this machine is started or stopped.
+    Server server(QDBusConnection(QStringLiteral("ftpconfig-no-bus")));
+    ModalHelper modal(30000);
+    Answerer answerer(modal);
+    QStringList problems;
+    std::streambuf *out = std::cout.rdbuf(std::cerr.rdbuf());
+    auto window = std::make_unique<CMainWindow>(server);
+    if (!window->model()) {
+        std::cout.rdbuf(out);
+        std::puts("refused save-failed");
+        return 1;
+    }
+    window->show();
+    if (!QTest::qWaitForWindowExposed(window.get()))
+        problems << QStringLiteral("the window is not shown");
+    FtpServerConfig &config = window->model()->config();
+    const AppStrings &strings = AppStrings::instance();
+
+    // The user the table is to show (or no longer show) afterwards.
+    QString shown = user;
+    bool performed = false;
+    if (operation == QLatin1String("vadd")) {
+        answerer.setTyped({user, args[5]});
+        performed = trigger(*window, "actionAdd_user", problems);
+    } else if (operation == QLatin1String("vchange")) {
+        shown = args[5];
+        answerer.setTyped({shown, args[6]});
+        performed = select(*window, user, problems) && trigger(*window, "actionEdit_user", problems);
+    } else if (operation == QLatin1String("vdelete")) {
+        performed = select(*window, user, problems) && trigger(*window, "actionDelete_user", problems);
+    } else {
+        performed = chooseStatus(*window, user, operation == QLatin1String("grant") ? strings.allowed : strings.denied,
+                                 problems);
+    }
+
+    answerer.setSaving(true);
+    const bool saved = performed && trigger(*window, "actionSave", problems) && !answerer.saveRefused()
+        && !window->model()->hasUnsavedChanges();
+    answerer.setSaving(false);
+
+    // What the table and the engine hold once saved.
+    const auto expect = [&problems](bool holds, const QString &what) {
+        if (!holds)
+            problems << what;
+        return holds;
+    };
+    bool done = performed;
+    if (performed && virtualEdit) {
+        const bool kept = operation != QLatin1String("vdelete");
+        done = expect(rowOf(*window, shown, TreeModel::UsersColumn).isValid() == kept,
+                      QStringLiteral("the table %1 %2")
+                          .arg(kept ? QStringLiteral("lacks") : QStringLiteral("still shows"), shown))
+            && expect(config.isVirtualUser(shown.toUtf8()) == kept,
+                      QStringLiteral("%1 is %2 a virtual user")
+                          .arg(shown, kept ? QStringLiteral("not") : QStringLiteral("still")));
+        if (shown != user)
+            done = expect(!config.isVirtualUser(user.toUtf8()), user + QStringLiteral(" is still a virtual user"))
+                && done;
+    } else if (performed) {
+        const QString status = operation == QLatin1String("grant") ? strings.allowed : strings.denied;
+        const QString cell = rowOf(*window, user, TreeModel::StatusColumn).data().toString();
+        done = expect(cell == status, QStringLiteral("the status of %1 reads \"%2\"").arg(user, cell))
+            && expect(config.checkAccess(user.toUtf8(), false) == (status == strings.allowed),
+                      QStringLiteral("the engine disagrees with the status of ") + user);
+    }
+    window.reset();
+    std::cout.rdbuf(out);
+
+    // The one expectation left is the answerer's, armed for a next box.
+    modal.done();
+    const QStringList left = modal.report().split(QLatin1Char('\n'), Qt::SkipEmptyParts);
+    problems << answerer.problems();
+    for (const QString &line : left) {
+        if (!line.startsWith(QLatin1String("never came up")))
+            problems << line;
+    }
+    for (const QString &problem : problems)
+        std::fprintf(stderr, "problem: %s\n", qPrintable(problem));
+    done = done && problems.isEmpty();
+    std::printf("%s %s\n", done ? "done" : "refused", saved ? "saved" : "save-failed");
+    return done && saved ? 0 : 1;
+}
