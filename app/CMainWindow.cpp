@@ -5,6 +5,7 @@
 #include "VexHelpMenu.h"
 #include "VexIcon.h"
 #include "dialogs/GuiInteraction.h"
+#include "options/COptionsDialog.h"
 #include "policy/FtpServerConfig.h"
 #include "ui_CMainWindow.h"
 #include "usertable/CDirSelectorDelegate.h"
@@ -238,11 +239,6 @@ void CMainWindow::connectActions()
     connect(m_ui->actionExit, &QAction::triggered, this, &CMainWindow::exit);
     connect(m_ui->actionOptions, &QAction::triggered, this, &CMainWindow::showSettingsDialog);
     connect(m_view, &CMainTreeView::selected, this, &CMainWindow::viewElementActivated);
-
-    // The options dialog is not part of the program yet: its action says
-    // so instead of doing nothing.
-    m_ui->actionOptions->setEnabled(false);
-    m_ui->actionOptions->setToolTip(tr("Not available in this version"));
 }
 
 TreeModel *CMainWindow::model() const
@@ -455,10 +451,19 @@ void CMainWindow::exit()
 
 void CMainWindow::showSettingsDialog()
 {
-    // The options dialog goes here: load, exec, and on acceptance store
-    // into the engine, rebuild the model, re-filter, expand, mark unsaved
-    // and onDataChanged(). Until it exists the action stays disabled and
-    // nothing is opened.
+    COptionsDialog dialog(m_model->config(), this);
+    dialog.load();
+    if (dialog.exec() != QDialog::Accepted)
+        return;
+    dialog.save();
+    m_model->config().optionsChanged();
+    m_model->setUnsavedChanges(true);
+    // Every verdict may change with the options: the rows are made again,
+    // which the proxy filters anew.
+    m_model->rebuild();
+    m_view->expandAll();
+    viewElementActivated(m_view->currentIndex());
+    onDataChanged();
 }
 
 void CMainWindow::onDataChanged()

@@ -199,6 +199,21 @@ void FtpServerConfig::optionsChanged()
         loadChrootList();
 }
 
+void FtpServerConfig::setChrootList(const QByteArray &path, const QStringList &names)
+{
+    const NameList list(names);
+    if (path == m_chrootListPath && list.names() == m_chrootList.names())
+        return;
+    if (path != m_chrootListPath) {
+        // What the file holds now, so that a save writes it only when the
+        // names differ.
+        m_loadedText[text(path)] = nameListContent(NameList(readNameList(path)), path).toStdString();
+    }
+    m_chrootListPath = path;
+    m_chrootList = list;
+    m_chrootListModified = m_modified = true;
+}
+
 QByteArray FtpServerConfig::ftpAccountName(const QByteArray &user) const
 {
     if (isAnonymousUser(user))

@@ -151,6 +151,15 @@ public:
     void setOption(const QByteArray &key, const QByteArray &value);
     void removeOption(const QByteArray &key);
     void optionsChanged();
+    // A side file the options name (banner, message, e-mail or chroot
+    // list), written at once through the same writer as a save. Nothing on
+    // success, otherwise why not. A list the engine holds counts as saved
+    // with this content, so that the next save leaves the file alone.
+    std::optional<QString> writeSideFile(const QByteArray &path, const QByteArray &content);
+    // The chroot list the options dialog accepted, for the list file the
+    // options now name: it replaces the one in memory, which would
+    // otherwise be written over the dialog's at the next save.
+    void setChrootList(const QByteArray &path, const QStringList &names);
 
     // Main configuration value of a key, or the default when absent.
     QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;

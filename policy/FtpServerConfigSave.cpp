@@ -41,6 +41,16 @@ std::optional<QString> FtpServerConfig::writeFile(const QString &file, const QBy
     return writeFileAtomically(file, content, 0644, trustedTop(m_root));
 }
 
+std::optional<QString> FtpServerConfig::writeSideFile(const QByteArray &path, const QByteArray &content)
+{
+    if (const auto error = writeFile(resolved(path), content))
+        return error;
+    const auto loaded = m_loadedText.find(text(path));
+    if (loaded != m_loadedText.end())
+        loaded->second = content.toStdString();
+    return std::nullopt;
+}
+
 void FtpServerConfig::reportUnsaved(const QString &shown, const QString &reason)
 {
     m_interaction.show({Interaction::Icon::Critical, QString(), tr("Unable to save %1").arg(shown), QString(), reason});
