@@ -239,18 +239,18 @@ const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
 
 std::optional<ForecastFinding> LoginForecast::checkRoot(const QByteArray &account, const QByteArray &directory,
                                                         bool chrooted, bool allowWriteable, bool mustEnter,
-                                                        const QString &what) const
+                                                        const std::function<QString()> &what) const
 {
     AccountRecord record;
     m_config.accounts().getUserInfo(account, record);
     std::optional<struct stat> status;
     if (!directory.isEmpty())
-        status = m_config.fileStatus(m_config.root().resolve(text(directory)));
+        status = m_config.pathStatus(directory);
     if (!status || !S_ISDIR(status->st_mode)) {
         return ForecastFinding{Severity::Error, QString(), 0,
                                QStringLiteral("%1 %2 does not exist: vsftpd ends the session (cannot change "
                                               "directory)")
-                                   .arg(what, text(directory))};
+                                   .arg(what(), text(directory))};
     }
     const struct stat &info = *status;
     int shift = 0;
@@ -268,13 +268,13 @@ std::optional<ForecastFinding> LoginForecast::checkRoot(const QByteArray &accoun
     if (mustEnter && !enterable) {
         return ForecastFinding{Severity::Error, QString(), 0,
                                QStringLiteral("%1 %2 cannot be entered by the account %3: vsftpd ends the session")
-                                   .arg(what, text(directory), text(account))};
+                                   .arg(what(), text(directory), text(account))};
     }
     if (chrooted && writable && !allowWriteable) {
         return ForecastFinding{Severity::Error, QString(), 0,
                                QStringLiteral("%1 %2 is writable by the account %3 and is the chroot: vsftpd refuses "
                                               "(writable root inside chroot) unless allow_writeable_chroot=YES")
-                                   .arg(what, text(directory), text(account))};
+                                   .arg(what(), text(directory), text(account))};
     }
     return std::nullopt;
 }
@@ -330,8 +330,10 @@ UserForecast LoginForecast::forecastAnonymous()
     m_config.accounts().getUserInfo(account, record);
     const bool anonRoot = m_settings.contains("anon_root");
     const QByteArray root = anonRoot ? m_settings.value("anon_root") : record.home;
-    const QString what = anonRoot ? QStringLiteral("the anonymous root (anon_root)")
-                                  : QStringLiteral("the anonymous root (home of %1)").arg(text(account));
+    const auto what = [&] {
+        return anonRoot ? QStringLiteral("the anonymous root (anon_root)")
+                        : QStringLiteral("the anonymous root (home of %1)").arg(text(account));
+    };
     // The anonymous root is entered with root's rights, and allow_writeable_chroot
     // does not apply to anonymous sessions.
     if (auto problem = checkRoot(account, root, true, false, false, what)) {
@@ -393,22 +395,25 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
     }
 
     const VsftpdSettings *own = userSettings(login);
-    QByteArray ownDirectory = m_settings.value("user_config_dir");
-    if (!ownDirectory.endsWith('/'))
-        ownDirectory += '/';
-    const QString ownPath = text(ownDirectory + login);
+    // Named only in a finding: most users have no file of their own.
+    const auto ownPath = [&] {
+        QByteArray ownDirectory = m_settings.value("user_config_dir");
+        if (!ownDirectory.endsWith('/'))
+            ownDirectory += '/';
+        return text(ownDirectory + login);
+    };
     if (own && !own->errors().isEmpty()) {
         const auto &problem = own->errors().first();
-        return deny(ownPath, problem.line, problem.message);
+        return deny(ownPath(), problem.line, problem.message);
     }
-    const auto setting = [&](const QByteArray &key) -> const VsftpdSettings::Setting * {
+    const auto setting = [&](const auto &key) -> const VsftpdSettings::Setting * {
         if (own) {
             if (const auto *value = own->find(key))
                 return value;
         }
         return m_settings.find(key);
     };
-    const auto yes = [&](const QByteArray &key, bool defaultValue) {
+    const auto yes = [&](const auto &key, bool defaultValue) {
         if (own && own->contains(key))
             return own->isYes(key, defaultValue);
         return m_settings.isYes(key, defaultValue);
@@ -433,23 +438,24 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
 
     // The session starts in the home of its account; a local_root that
     // exists replaces it, one that does not is passed over.
-    const QString homeWhat = QStringLiteral("the home directory of %1").arg(text(account));
+    const std::function<QString()> homeWhat
+        = [&] { return QStringLiteral("the home directory of %1").arg(text(account)); };
     if (auto problem = checkRoot(account, record.home, false, true, true, homeWhat))
         return deny(QStringLiteral("/etc/passwd"), 0, problem->message);
     QByteArray root = record.home;
-    QString rootWhat = homeWhat;
+    std::function<QString()> rootWhat = homeWhat;
     if (const auto *localRoot = setting("local_root")) {
         QByteArray directory = localRoot->value;
         const QByteArray token = setting("user_sub_token") ? setting("user_sub_token")->value : QByteArray();
         if (!token.isEmpty())
             directory.replace(token, login);
-        const auto status = m_config.fileStatus(m_config.root().resolve(text(directory)));
+        const auto status = m_config.pathStatus(directory);
         if (status && S_ISDIR(status->st_mode)) {
             root = directory;
-            rootWhat = QStringLiteral("the local_root");
+            rootWhat = [] { return QStringLiteral("the local_root"); };
         } else if (chrooted) {
             // Confined, the session must change into it before the chroot.
-            return deny(own && own->find("local_root") ? ownPath : m_mainPath, localRoot->line,
+            return deny(own && own->find("local_root") ? ownPath() : m_mainPath, localRoot->line,
                         QStringLiteral("local_root %1 does not exist and the session is confined to it: vsftpd ends "
                                        "the session (cannot change directory)")
                             .arg(text(directory)));

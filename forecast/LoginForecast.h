@@ -9,6 +9,7 @@
 #include <QSet>
 #include <QString>
 
+#include <functional>
 #include <map>
 #include <memory>
 #include <optional>
@@ -63,7 +64,8 @@ private:
     void checkServer();
     bool isListed(const QByteArray &login) const;
     std::optional<ForecastFinding> checkRoot(const QByteArray &account, const QByteArray &directory, bool chrooted,
-                                             bool allowWriteable, bool mustEnter, const QString &what) const;
+                                             bool allowWriteable, bool mustEnter,
+                                             const std::function<QString()> &what) const;
     const VsftpdSettings *userSettings(const QByteArray &login);
 
     FtpServerConfig &m_config;

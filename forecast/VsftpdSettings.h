@@ -49,6 +49,29 @@ public:
     bool isYes(const QByteArray &key, bool defaultValue) const;
     int line(const QByteArray &key) const;
 
+    // The same for a key written in the code: looked up without copying it
+    // to the heap, as happens several times for every user of a report.
+    template <size_t N> bool contains(const char (&key)[N]) const
+    {
+        return contains(QByteArray::fromRawData(key, N - 1));
+    }
+    template <size_t N> const Setting *find(const char (&key)[N]) const
+    {
+        return find(QByteArray::fromRawData(key, N - 1));
+    }
+    template <size_t N> QByteArray value(const char (&key)[N], const QByteArray &defaultValue = {}) const
+    {
+        return value(QByteArray::fromRawData(key, N - 1), defaultValue);
+    }
+    template <size_t N> bool isYes(const char (&key)[N], bool defaultValue) const
+    {
+        return isYes(QByteArray::fromRawData(key, N - 1), defaultValue);
+    }
+    template <size_t N> int line(const char (&key)[N]) const
+    {
+        return line(QByteArray::fromRawData(key, N - 1));
+    }
+
 private:
     void readLine(const QByteArray &key, const QByteArray &value, int line);
 

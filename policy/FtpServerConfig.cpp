@@ -65,6 +65,16 @@ QByteArray FtpServerConfig::configuredChrootListPath() const
     return value("chroot_list_file", "/etc/vsftpd.chroot_list");
 }
 
+std::optional<struct stat> FtpServerConfig::pathStatus(const QByteArray &path) const
+{
+    if (!m_pass)
+        return fileStatus(resolved(path));
+    auto it = m_pass->paths.constFind(path);
+    if (it == m_pass->paths.constEnd())
+        it = m_pass->paths.insert(path, fileStatus(resolved(path)));
+    return *it;
+}
+
 std::optional<QByteArray> FtpServerConfig::mainValue(const QByteArray &key) const
 {
     const auto read = [&]() -> std::optional<QByteArray> {

@@ -76,6 +76,9 @@ public:
     // stat() of a path already resolved under the root, following links;
     // empty when it fails.
     std::optional<struct stat> fileStatus(const QString &resolvedPath) const;
+    // The same for a path as the files name it: within a pass it is
+    // resolved once, however many users share it (a guest root).
+    std::optional<struct stat> pathStatus(const QByteArray &path) const;
 
     // May the user log in? With repair, each refusal that a change of the
     // in-memory files can cure is cured, and the operator is asked where a
@@ -165,6 +168,16 @@ public:
     QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;
     // Lower-cased value compared with "yes"; absent gives the default.
     bool isYes(const QByteArray &key, bool absentMeansYes = false) const;
+    // Keys written in the code, looked up without a copy on the heap: the
+    // checks ask for several of them for every user.
+    template <size_t N> QByteArray value(const char (&key)[N], const QByteArray &defaultValue = {}) const
+    {
+        return value(QByteArray::fromRawData(key, N - 1), defaultValue);
+    }
+    template <size_t N> bool isYes(const char (&key)[N], bool absentMeansYes = false) const
+    {
+        return isYes(QByteArray::fromRawData(key, N - 1), absentMeansYes);
+    }
 
     ConfigFile &mainConfig();
     // False when the main configuration was missing at load (and, read-only,
@@ -259,6 +272,7 @@ private:
     struct PassCache
     {
         QHash<QString, std::optional<struct stat>> metadata;
+        QHash<QByteArray, std::optional<struct stat>> paths;
         QHash<QByteArray, std::optional<QByteArray>> values;
     };
     mutable std::unique_ptr<PassCache> m_pass;

@@ -91,16 +91,16 @@ bool FtpServerConfig::checkReserved(const QByteArray &, bool, AccessFailure *)
 bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, AccessFailure *failure)
 {
     const QByteArray directory = effectiveRoot(user);
-    const QString shown = text(directory);
-    const QString onDisk = resolved(directory);
+    // Made only for a refusal: most users pass.
+    const auto shown = [&directory] { return text(directory); };
     std::optional<struct stat> info;
     if (!directory.isEmpty())
-        info = fileStatus(onDisk);
+        info = pathStatus(directory);
     if (!info || !S_ISDIR(info->st_mode)) {
         if (repair) {
             Interaction::Question question;
             question.message
-                = {Interaction::Icon::Question, QString(), tr("User home directory %1 does not exist.").arg(shown),
+                = {Interaction::Icon::Question, QString(), tr("User home directory %1 does not exist.").arg(shown()),
                    tr("Do you want to create it?"), QString()};
             question.buttons = {Interaction::Button::Accept, Interaction::Button::Cancel};
             question.acceptText = tr("Create");
@@ -109,21 +109,22 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
                     return false;
             } else {
                 return refuse(failure, FailureKind::Filesystem,
-                              refusal("user home directory %1 does not exist.").arg(shown));
+                              refusal("user home directory %1 does not exist.").arg(shown()));
             }
         } else {
             return refuse(failure, FailureKind::Filesystem,
-                          refusal("user home directory %1 does not exist.").arg(shown));
+                          refusal("user home directory %1 does not exist.").arg(shown()));
         }
     }
     if (!isAnonymousUser(user))
         return true;
 
     const QByteArray account = ftpAccountName(user);
+    const QString onDisk = resolved(directory);
     // Read again: a repair above may have created it.
     info = fileStatus(onDisk);
     if (!info)
-        return refuse(failure, FailureKind::Filesystem, refusal("user home directory %1 does not exist.").arg(shown));
+        return refuse(failure, FailureKind::Filesystem, refusal("user home directory %1 does not exist.").arg(shown()));
     AccountRecord anonymous;
     const bool haveAccount = m_accounts && m_accounts->getUserInfo(account, anonymous);
     if (haveAccount && info->st_uid == anonymous.uid) {
@@ -136,7 +137,7 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
         }
         if (!owner || owner->isEmpty()) {
             return refuse(failure, FailureKind::Filesystem,
-                          refusal("user home directory %1 is owned by anonymous user %2.").arg(shown, text(account)));
+                          refusal("user home directory %1 is owned by anonymous user %2.").arg(shown(), text(account)));
         }
         AccountRecord chosen;
         if (!m_accounts->getUserInfo(owner->toUtf8(), chosen)
@@ -144,7 +145,7 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
             m_interaction.show({Interaction::Icon::Critical, QString(), tr("Unable to change root directory owner."),
                                 tr("Unable to change ftp root owner"), QString()});
             return refuse(failure, FailureKind::Filesystem,
-                          refusal("user home directory %1 is owned by anonymous user %2.").arg(shown, text(account)));
+                          refusal("user home directory %1 is owned by anonymous user %2.").arg(shown(), text(account)));
         }
     }
 
@@ -175,7 +176,7 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
                           refusal("user home directory %1 is writable by group %2, in which anonymous user %2 "
                                   "participates in.")
                               // Both %2 name the group: the account has no place in the text.
-                              .arg(shown, text(groupName)));
+                              .arg(shown(), text(groupName)));
         }
     }
     return true;
