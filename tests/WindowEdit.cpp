@@ -10,6 +10,7 @@
 // with its accepting button; each one's text goes to stderr. Prints
 // "done saved" and exits 0 when the edit took and the save reported nothing.
 #include "ModalHelper.h"
+#include "WindowFixture.h"
 #include "app/CMainWindow.h"
 #include "app/Server.h"
 #include "common/AppStrings.h"
@@ -175,10 +176,7 @@ private:
 // The shown row of a user (or a group), at the column.
 QModelIndex rowOf(const CMainWindow &window, const QString &name, int column)
 {
-    const TreeModel &model = *window.model();
-    const QModelIndexList found
-        = model.match(model.index(0, 0), Qt::DisplayRole, name, 1, Qt::MatchExactly | Qt::MatchRecursive);
-    return found.isEmpty() ? QModelIndex() : window.proxy()->mapFromSource(found.first().siblingAtColumn(column));
+    return window.proxy()->mapFromSource(WindowFixture::find(*window.model(), name, column));
 }
 
 // Triggers the action as the menu would: only when it is offered.
