@@ -4,6 +4,7 @@
 
 #include <QFile>
 
+#include <algorithm>
 #include <cstdio>
 #include <grp.h>
 #include <iostream>
@@ -233,9 +234,13 @@ void AccountStore::loadVirtualUsers(const QByteArray &path)
     m_virtualNames.clear();
     m_virtualUsersChanged = false;
     auto records = m_db->readAll();
+    // The hash file gives its keys in no order: sorted first, each goes in
+    // at the end of the map instead of by a walk down the tree.
+    std::sort(records.begin(), records.end(), [](const auto &a, const auto &b) { return a.first < b.first; });
     m_virtualNames.reserve(static_cast<int>(records.size()));
     for (auto &[name, password] : records) {
-        m_virtualUsers.emplace(name, VirtualUserRecord{password, {}, VirtualUserState::Unchanged});
+        m_virtualUsers.emplace_hint(m_virtualUsers.end(), name,
+                                    VirtualUserRecord{password, {}, VirtualUserState::Unchanged});
         m_virtualNames.insert(name);
     }
 }
@@ -321,6 +326,20 @@ void AccountStore::syncVirtualUsers()
     // Closing flushes the pages to the file that pam_userdb reads.
     m_db->close();
     m_db->open();
+    // What is in memory is now what is on disk. Left marked, the next save
+    // would delete a renamed user's first name again instead of the name
+    // it has on disk now, and a deleted name would still count as a user.
+    for (auto it = m_virtualUsers.begin(); it != m_virtualUsers.end();) {
+        if (it->second.state == VirtualUserState::Deleted) {
+            m_virtualNames.remove(it->first);
+            it = m_virtualUsers.erase(it);
+            continue;
+        }
+        it->second.state = VirtualUserState::Unchanged;
+        it->second.previousName.clear();
+        ++it;
+    }
+    m_virtualUsersChanged = false;
 }
 
 void AccountStore::recreateVirtualUserDb()

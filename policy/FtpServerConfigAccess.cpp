@@ -325,7 +325,9 @@ void FtpServerConfig::blockUserByUserlist(const QByteArray &user)
         // the blocked ones.
         m_userlist.clear();
     }
-    m_userlist.append(text(user));
+    // Denied twice (an editor committed again), the name is still listed once.
+    if (!m_userlist.contains(text(user)))
+        m_userlist.append(text(user));
     setValue(m_main.elements, "", "userlist_file", str(path));
     m_userlistModified = m_modified = true;
 }

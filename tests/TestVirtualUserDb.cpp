@@ -135,14 +135,20 @@ void TestVirtualUserDb::saveAndReload()
         store.removeVirtualUser("carl");
         store.addVirtualUser("dora", "d1");
         store.syncVirtualUsers();
-        // States are kept: a second save repeats the same writes harmlessly.
-        store.syncVirtualUsers();
         QCOMPARE(dumped(root.filePath(DbFile)), QStringLiteral("anne=a2 ben=b2 dora=d1"));
         QCOMPARE(fileMode(root.filePath(DbFile)), 0600);
+        // Saved, memory says what the disk holds: a second rename moves the
+        // name the user has now, and the deleted name is nobody.
+        QCOMPARE(describe(store.virtualUsers()),
+                 QStringLiteral("anne=a2//Unchanged ben=b2//Unchanged dora=d1//Unchanged"));
+        QVERIFY(!store.isVirtualUser("carl"));
+        store.changeVirtualUser("anne", "anya", {});
+        store.syncVirtualUsers();
+        QCOMPARE(dumped(root.filePath(DbFile)), QStringLiteral("anya=a2 ben=b2 dora=d1"));
     }
     const AccountStore reloaded(DbPath, RootDirectory(root.path()));
     QCOMPARE(describe(reloaded.virtualUsers()),
-             QStringLiteral("anne=a2//Unchanged ben=b2//Unchanged dora=d1//Unchanged"));
+             QStringLiteral("anya=a2//Unchanged ben=b2//Unchanged dora=d1//Unchanged"));
 }
 
 void TestVirtualUserDb::readsWhatDbLoadWrote()
