@@ -369,8 +369,21 @@ void CMainWindow::addUser()
                              tr("User %1 allready exists in users database.").arg(dialog.userName()));
         return;
     }
+    if (refuseLocalName(name))
+        return;
     m_model->addVirtualUser(name, dialog.password().toUtf8());
     showVirtualUser(dialog.userName());
+}
+
+bool CMainWindow::refuseLocalName(const QByteArray &name)
+{
+    // One name, two users: the table could not tell them apart, and which
+    // password a login takes would depend on the PAM file's order. Renaming
+    // in the table refuses it the same way.
+    if (!m_model->config().accounts().accounts().count(name))
+        return false;
+    QMessageBox::warning(this, windowTitle(), tr("A user named %1 exists already.").arg(QString::fromUtf8(name)));
+    return true;
 }
 
 void CMainWindow::editUser()
@@ -402,6 +415,8 @@ void CMainWindow::editUser()
                              tr("User %1 allready exists in users database.").arg(dialog.userName()));
         return;
     }
+    if (name != oldName.toUtf8() && refuseLocalName(name))
+        return;
     // A new name moves the record: the save deletes the old key and writes
     // the new one.
     m_model->changeVirtualUser(oldName.toUtf8(), name, password);

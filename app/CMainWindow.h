@@ -73,6 +73,9 @@ private:
     // still shown.
     void refilterKeepingCurrent(void (CUsersFilterProxyModel::*setHidden)(bool), bool hide);
     QModelIndex currentSourceIndex() const;
+    // Warns and returns true when a virtual user would take a local
+    // account's name.
+    bool refuseLocalName(const QByteArray &name);
     // Runs the virtual user dialog with its Ok button held back until the
     // first edit; true when it holds a name and password to store.
     bool runVirtualUserDialog(CreateVUserDialog &dialog);

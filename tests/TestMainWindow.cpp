@@ -538,6 +538,11 @@ private Q_SLOTS:
             << true << QString() << strings("eve", "e", "e") << QString() << strings("dave=d", "eve=e");
         QTest::newRow("name of another user") << true << QString() << strings("dave", "c", "c")
                                               << exists.arg(QLatin1String("dave")) << strings("carol=c", "dave=d");
+        const QString local = QStringLiteral("A user named root exists already.");
+        QTest::newRow("local account's name")
+            << false << QString() << strings("root", "x", "x") << local << strings("carol=c", "dave=d");
+        QTest::newRow("renamed to a local account")
+            << true << QString() << strings("root", "c", "c") << local << strings("carol=c", "dave=d");
     }
 
     void addOrEdit()
