@@ -6,6 +6,13 @@
 //   windowedit --root DIR vdelete NAME
 //   windowedit --root DIR grant USER
 //   windowedit --root DIR deny USER
+//   windowedit --root DIR options WIDGET=VALUE...
+// The options edit sets widgets of the options dialog by object name, each
+// on its page as the administrator turns to it, and must change every page:
+// "on"/"off" for check boxes, radio buttons and checkable group boxes, the
+// text of a line edit or of a combo entry, the number of a spin box; a push
+// button is clicked once per comma-separated piece of VALUE, the piece typed
+// into the input dialog it opens. Then OK.
 // Every box and dialog is answered the way editchild answers the engine:
 // with its accepting button; each one's text goes to stderr. Prints
 // "done saved" and exits 0 when the edit took and the save reported nothing.
@@ -16,6 +23,7 @@
 #include "common/AppStrings.h"
 #include "dialogs/PAMDialog.h"
 #include "dialogs/SelectDirectoryOwnerDialog.h"
+#include "options/COptionsDialog.h"
 #include "policy/FtpServerConfig.h"
 #include "usertable/CMainTreeView.h"
 #include "usertable/CUsersFilterProxyModel.h"
@@ -24,11 +32,20 @@
 
 #include <QAction>
 #include <QApplication>
+#include <QCheckBox>
 #include <QComboBox>
 #include <QDBusConnection>
+#include <QDoubleSpinBox>
+#include <QGroupBox>
+#include <QInputDialog>
 #include <QLineEdit>
+#include <QListWidget>
 #include <QMap>
 #include <QPushButton>
+#include <QRadioButton>
+#include <QSet>
+#include <QSpinBox>
+#include <QStackedWidget>
 #include <QTemporaryDir>
 #include <QTest>
 
@@ -46,6 +63,54 @@ struct Typed
     QString password;
 };
 
+// One widget of the options dialog and what it is set to.
+struct Setting
+{
+    QString widget;
+    QString value;
+};
+
+// A widget's state in the words of a setting; a null string for a kind of
+// widget that has none (a push button).
+QString stateOf(const QWidget *widget)
+{
+    const auto onOff = [](bool on) { return on ? QStringLiteral("on") : QStringLiteral("off"); };
+    if (auto *button = qobject_cast<const QAbstractButton *>(widget))
+        return button->isCheckable() ? onOff(button->isChecked()) : QString();
+    if (auto *group = qobject_cast<const QGroupBox *>(widget))
+        return group->isCheckable() ? onOff(group->isChecked()) : QString();
+    if (auto *edit = qobject_cast<const QLineEdit *>(widget))
+        return edit->text();
+    if (auto *combo = qobject_cast<const QComboBox *>(widget))
+        return combo->currentText();
+    if (auto *spin = qobject_cast<const QSpinBox *>(widget))
+        return QString::number(spin->value());
+    if (auto *spin = qobject_cast<const QDoubleSpinBox *>(widget))
+        return QString::number(spin->value());
+    return QString();
+}
+
+// Sets the widget as the administrator would: clicks, keys, a choice.
+void setState(QWidget *widget, const QString &value)
+{
+    if (auto *button = qobject_cast<QAbstractButton *>(widget)) {
+        if (stateOf(button) != value)
+            button->click();
+    } else if (auto *group = qobject_cast<QGroupBox *>(widget)) {
+        group->setChecked(value == QLatin1String("on"));
+    } else if (auto *edit = qobject_cast<QLineEdit *>(widget)) {
+        edit->selectAll();
+        QTest::keyClick(edit, Qt::Key_Delete);
+        QTest::keyClicks(edit, value);
+    } else if (auto *combo = qobject_cast<QComboBox *>(widget)) {
+        combo->setCurrentIndex(combo->findText(value));
+    } else if (auto *spin = qobject_cast<QSpinBox *>(widget)) {
+        spin->setValue(value.toInt());
+    } else if (auto *spin = qobject_cast<QDoubleSpinBox *>(widget)) {
+        spin->setValue(value.toDouble());
+    }
+}
+
 // Answers whatever comes up, in the order it comes, and keeps what was
 // wrong: the edit's own dialog is filled once (a second showing means the
 // dialog refused what was typed), every question gets its accepting button,
@@ -62,6 +127,14 @@ public:
     void setTyped(const Typed &typed)
     {
         m_typed = typed;
+    }
+    void setOptions(const QList<Setting> &settings)
+    {
+        m_settings = settings;
+    }
+    bool optionsAccepted() const
+    {
+        return m_optionsAccepted;
     }
     // A refusal while saving is the save's: it failed.
     void setSaving(bool saving)
@@ -95,6 +168,17 @@ private:
         std::fprintf(stderr, "dialog: %s\n", qPrintable(widget->windowTitle()));
         if (auto *dialog = qobject_cast<CreateVUserDialog *>(widget))
             return fill(dialog);
+        if (auto *dialog = qobject_cast<COptionsDialog *>(widget))
+            return fill(dialog);
+        if (auto *input = qobject_cast<QInputDialog *>(widget)) {
+            auto *edit = input->findChild<QLineEdit *>();
+            if (m_inputs.isEmpty() || !edit)
+                return refuse(input, QStringLiteral("nothing to type"));
+            QTest::keyClicks(edit, m_inputs.takeFirst());
+            if (!ModalHelper::press(input, QDialogButtonBox::Ok))
+                refuse(input, QStringLiteral("OK not enabled"));
+            return;
+        }
         if (auto *pam = qobject_cast<PAMDialog *>(widget)) {
             // As editchild: the PAM configuration is taken as it is.
             if (auto *valid = pam->findChild<QPushButton *>(QStringLiteral("valid_button")))
@@ -156,6 +240,70 @@ private:
             refuse(dialog, QStringLiteral("OK not enabled"));
     }
 
+    // Each setting on its page, turned to through the page list; every page
+    // changed once at least, then OK.
+    void fill(COptionsDialog *dialog)
+    {
+        if (m_filled || m_settings.isEmpty())
+            return refuse(dialog, m_filled ? QStringLiteral("shown again") : QStringLiteral("not asked for"));
+        m_filled = true;
+        auto *pageList = dialog->findChild<QListWidget *>(QStringLiteral("pagesListWidget"));
+        auto *pages = dialog->findChild<QStackedWidget *>(QStringLiteral("pagesStackedWidget"));
+        if (!pageList || !pages)
+            return refuse(dialog, QStringLiteral("no pages"));
+        QSet<int> changed;
+        for (const Setting &setting : qAsConst(m_settings)) {
+            QWidget *widget = dialog->findChild<QWidget *>(setting.widget);
+            int page = 0;
+            while (widget && page < pages->count() && !pages->widget(page)->isAncestorOf(widget))
+                ++page;
+            if (!widget || page == pages->count()) {
+                m_problems << QStringLiteral("no widget %1 on a page").arg(setting.widget);
+                continue;
+            }
+            const QString title = pageList->item(page)->text();
+            pageList->setCurrentRow(page);
+            if (pages->currentIndex() != page || !widget->isVisible() || !widget->isEnabled()) {
+                m_problems << QStringLiteral("%1 is not offered on the page \"%2\"").arg(setting.widget, title);
+                continue;
+            }
+            const QString before = stateOf(widget);
+            if (auto *button = qobject_cast<QAbstractButton *>(widget); button && before.isNull()) {
+                // A button that asks for what to add, once a piece.
+                for (const QString &piece : setting.value.split(QLatin1Char(','))) {
+                    m_inputs << piece;
+                    button->click();
+                }
+                if (!m_inputs.isEmpty()) {
+                    m_problems
+                        << QStringLiteral("%1 did not ask for %2").arg(setting.widget, m_inputs.join(QLatin1Char(',')));
+                    m_inputs.clear();
+                    continue;
+                }
+            } else {
+                setState(widget, setting.value);
+                if (before == setting.value || stateOf(widget) != setting.value) {
+                    m_problems << QStringLiteral("%1 on \"%2\": \"%3\" before, \"%4\" now, \"%5\" wanted")
+                                      .arg(setting.widget, title, before, stateOf(widget), setting.value);
+                    continue;
+                }
+            }
+            std::fprintf(stderr, "options: %s: %s=%s\n", qPrintable(title), qPrintable(setting.widget),
+                         qPrintable(setting.value));
+            changed.insert(page);
+        }
+        for (int page = 0; page < pages->count(); ++page) {
+            if (!changed.contains(page))
+                m_problems << QStringLiteral("nothing changed on the page \"%1\"").arg(pageList->item(page)->text());
+        }
+        if (!ModalHelper::press(dialog, QDialogButtonBox::Ok))
+            return refuse(dialog, QStringLiteral("no OK button"));
+        // A refused value leaves the dialog open.
+        m_optionsAccepted = dialog->result() == QDialog::Accepted && !dialog->isVisible();
+        if (!m_optionsAccepted)
+            refuse(dialog, QStringLiteral("OK did not close it"));
+    }
+
     void refuse(QWidget *widget, const QString &why)
     {
         m_problems << QStringLiteral("\"%1\": %2").arg(widget->windowTitle(), why);
@@ -167,7 +315,10 @@ private:
 
     ModalHelper &m_modal;
     std::optional<Typed> m_typed;
+    QList<Setting> m_settings;
+    QStringList m_inputs;
     bool m_filled = false;
+    bool m_optionsAccepted = false;
     bool m_saving = false;
     bool m_saveRefused = false;
     QStringList m_problems;
@@ -233,7 +384,7 @@ bool chooseStatus(const CMainWindow &window, const QString &user, const QString 
 int usage()
 {
     std::fputs("usage: windowedit --root DIR vadd NAME PASSWORD | vchange OLD NEW PASSWORD | vdelete NAME"
-               " | grant USER | deny USER\n",
+               " | grant USER | deny USER | options WIDGET=VALUE...\n",
                stderr);
     return 2;
 }
@@ -256,12 +407,19 @@ int main(int argc, char **argv)
     qputenv("FTPCONFIG_ROOT", QFile::encodeName(args[2]));
     const QString operation = args[3];
     const QString user = args[4];
+    QList<Setting> options;
+    for (const QString &arg : args.mid(4)) {
+        const int equals = arg.indexOf(QLatin1Char('='));
+        if (operation == QLatin1String("options") && equals <= 0)
+            return usage();
+        options.append({arg.left(equals), arg.mid(equals + 1)});
+    }
     const QMap<QString, int> argumentCounts{{QStringLiteral("vadd"), 6},
                                             {QStringLiteral("vchange"), 7},
                                             {QStringLiteral("vdelete"), 5},
                                             {QStringLiteral("grant"), 5},
                                             {QStringLiteral("deny"), 5}};
-    if (args.size() != argumentCounts.value(operation))
+    if (operation != QLatin1String("options") && args.size() != argumentCounts.value(operation))
         return usage();
     const bool virtualEdit = operation.startsWith(QLatin1Char('v'));
 
@@ -283,6 +441,11 @@ int main(int argc, char **argv)
     FtpServerConfig &config = window->model()->config();
     const AppStrings &strings = AppStrings::instance();
 
+    const auto expect = [&problems](bool holds, const QString &what) {
+        if (!holds)
+            problems << what;
+        return holds;
+    };
     // The user the table is to show (or no longer show) afterwards.
     QString shown = user;
     bool performed = false;
@@ -295,6 +458,10 @@ int main(int argc, char **argv)
         performed = select(*window, user, problems) && trigger(*window, "actionEdit_user", problems);
     } else if (operation == QLatin1String("vdelete")) {
         performed = select(*window, user, problems) && trigger(*window, "actionDelete_user", problems);
+    } else if (operation == QLatin1String("options")) {
+        answerer.setOptions(options);
+        performed = trigger(*window, "actionOptions", problems) && answerer.optionsAccepted()
+            && expect(window->model()->hasUnsavedChanges(), QStringLiteral("the accepted options are not to be saved"));
     } else {
         performed = chooseStatus(*window, user, operation == QLatin1String("grant") ? strings.allowed : strings.denied,
                                  problems);
@@ -306,11 +473,6 @@ int main(int argc, char **argv)
     answerer.setSaving(false);
 
     // What the table and the engine hold once saved.
-    const auto expect = [&problems](bool holds, const QString &what) {
-        if (!holds)
-            problems << what;
-        return holds;
-    };
     bool done = performed;
     if (performed && virtualEdit) {
         const bool kept = operation != QLatin1String("vdelete");
@@ -323,7 +485,7 @@ int main(int argc, char **argv)
         if (shown != user)
             done = expect(!config.isVirtualUser(user.toUtf8()), user + QStringLiteral(" is still a virtual user"))
                 && done;
-    } else if (performed) {
+    } else if (performed && operation != QLatin1String("options")) {
         const QString status = operation == QLatin1String("grant") ? strings.allowed : strings.denied;
         const QString cell = rowOf(*window, user, TreeModel::StatusColumn).data().toString();
         done = expect(cell == status, QStringLiteral("the status of %1 reads \"%2\"").arg(user, cell))

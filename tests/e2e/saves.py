@@ -8,10 +8,14 @@ engine and saves, exactly as the program would: grant a user (every refusal
 the engine can cure is cured), deny a user, set a user's rights or root. A
 scenario with through = "window" has windowedit (--window) make its edit
 instead, through the main window itself: the virtual user dialog behind Add,
-Edit and Delete user, the status cell's editor, then the Save action. The
+Edit and Delete user, the status cell's editor, the options dialog (one
+setting or more on each of its pages, by widget name), then the Save action. The
 server is started again and must now do what the edit promised: the user
 logs in (and a wrong password still fails), the upload lands in the user's
-directory, the login fails. Every file and directory under /etc and under the
+directory, the login fails, the listing shows (or hides) a name, the
+greeting says the banner. With `forecast`, ftpconfig-report (--report) is
+asked about the saved files too, and its forecast for those users must be
+what the server did. Every file and directory under /etc and under the
 scenario's own directory is compared before and after the edit: only the
 ones the scenario names may change, and each of those must.
 
@@ -26,6 +30,7 @@ only inside scripts/with-private-etc.sh: it writes to /etc.
 import argparse
 import ftplib
 import io
+import json
 import os
 import pwd
 import socket
@@ -51,9 +56,10 @@ NO_LOGIN = "no-login"
 UPLOAD_NAME = "e2e-upload.txt"
 UPLOAD_DATA = b"uploaded through the saved rights\n"
 
-EDITS = ("grant", "deny", "rights", "directory", "vadd", "vchange", "vdelete")
+EDITS = ("grant", "deny", "rights", "directory", "vadd", "vchange", "vdelete", "options")
 # What windowedit does through the window; who makes a scenario's edit.
-WINDOW_EDITS = ("grant", "deny", "vadd", "vchange", "vdelete")
+WINDOW_EDITS = ("grant", "deny", "vadd", "vchange", "vdelete", "options")
+ENGINE_EDITS = ("grant", "deny", "rights", "directory", "vadd", "vchange", "vdelete")
 THROUGH = ("engine", "window")
 CHANGES = {harness.CONTENT, harness.MODE, harness.CREATED, harness.REMOVED}
 
@@ -109,6 +115,17 @@ def upload(ftp: ftplib.FTP) -> bytes:
     return back.getvalue()
 
 
+def welcome(port: int) -> str:
+    """The 220 line a client is greeted with."""
+    ftp = ftplib.FTP(timeout=harness.FTP_TIMEOUT)
+    try:
+        return ftp.connect("127.0.0.1", port, timeout=harness.FTP_TIMEOUT)
+    except (OSError, EOFError, ftplib.Error) as error:
+        return f"no greeting: {error!r}"
+    finally:
+        ftp.close()
+
+
 def greeting(port: int) -> str:
     """The whole of what a server that refuses to serve says to a client
     (the start's probe reads its first packet only)."""
@@ -140,12 +157,18 @@ class Checks:
         return ok
 
 
-def check_server(phase: str, scenario: Scenario, tmp: str, port: int, checks: Checks) -> None:
-    """Logins, uploads and listings of one phase ("before" or "after")."""
+def check_server(phase: str, scenario: Scenario, tmp: str, port: int, checks: Checks) -> Dict[str, str]:
+    """Logins, uploads, listings and the greeting of one phase ("before" or
+    "after"); what each login came to."""
+    logins = {}
     for user, expected in getattr(scenario, phase).items():
-        got, reply = harness.try_login(port, user, harness.password_of(user))
+        # The table's password: that of a virtual user may be an old one.
+        password = harness.credentials(scenario, user)[1] if user == harness.ANONYMOUS else harness.password_of(user)
+        got, reply = harness.try_login(port, user, password)
+        logins[user] = got
         checks.check(f"{phase}:login:{user}", got == expected, f"expected {expected}, server {got}: {reply.strip()}")
-        if got == ALLOWED:
+        # Anonymous sessions take any password.
+        if got == ALLOWED and user != harness.ANONYMOUS:
             # A server that admits anybody would prove nothing.
             wrong, reply = harness.try_login(port, user, harness.password_of(user) + "x")
             checks.check(f"{phase}:wrong-password:{user}", wrong == DENIED, f"admitted: {reply.strip()}")
@@ -172,17 +195,53 @@ def check_server(phase: str, scenario: Scenario, tmp: str, port: int, checks: Ch
             f"{on_disk}: {content!r}, owner {owner} (expected {uid})",
         )
     for item in scenario.listings:
+        if phase not in item:
+            continue
         # vsftpd answers an empty directory with 550.
         names, why = in_session(port, item["user"], lambda ftp: ftp.nlst())
         names = [] if isinstance(names, ftplib.Error) else names
+        shown = None if names is None else [os.path.basename(n) for n in names]
+        # A name, or names; "!name" is one the listing must not show.
+        wanted = [item[phase]] if isinstance(item[phase], str) else item[phase]
         checks.check(
             f"{phase}:listing:{item['user']}",
-            names is not None and item[phase] in [os.path.basename(n) for n in names],
-            f"{item[phase]} not in {names} {why}",
+            shown is not None and all((n[1:] not in shown) if n.startswith("!") else (n in shown) for n in wanted),
+            f"expected {wanted}, listed {names} {why}",
+        )
+    if phase in scenario.greeting:
+        said = welcome(port)
+        checks.check(f"{phase}:greeting", said == scenario.greeting[phase], f"greeted with {said!r}")
+    return logins
+
+
+def check_forecast(scenario: Scenario, report: str, run_dir: str, logins: Dict[str, str], checks: Checks) -> None:
+    """ftpconfig-report on the saved files: the server works, and each
+    named user's forecast is what the server did."""
+    done = harness.run_report(report, run_dir, "--json")
+    try:
+        document = json.loads(done.stdout) if done.returncode == 0 else {}
+    except ValueError:
+        document = {}
+    document = document if isinstance(document, dict) else {}
+    server = document.get("server")
+    failure = (done.stderr or done.stdout).strip()[:300]
+    checks.check(
+        "forecast:server",
+        isinstance(server, dict) and server.get("fails") is False,
+        f"the report's server: {server!r} {failure}",
+    )
+    rows = {row.get("name"): row for row in document.get("users", []) if isinstance(row, dict)}
+    for user in scenario.forecast:
+        row = rows.get(harness.ANONYMOUS_ROW if user == harness.ANONYMOUS else user) or {}
+        forecast = row.get("forecast") if isinstance(row.get("forecast"), dict) else {}
+        checks.check(
+            f"forecast:{user}",
+            forecast.get("status") == logins.get(user),
+            f"forecast {forecast.get('status')!r} {forecast.get('findings', '')}, server {logins.get(user)}",
         )
 
 
-def check_saved(scenario: Scenario, tmp: str, before, after, checks: Checks) -> None:
+def check_saved(scenario: Scenario, tmp: str, port: int, before, after, checks: Checks) -> None:
     declared = {harness.fill(path, tmp): what for path, what in scenario.changes.items()}
     found = harness.differences(before, after)
     for path in sorted(declared.keys() | found.keys()):
@@ -194,7 +253,7 @@ def check_saved(scenario: Scenario, tmp: str, before, after, checks: Checks) -> 
     for path, lines in scenario.saved_text.items():
         path = harness.fill(path, tmp)
         entry = after.get(path)
-        expected = "".join(harness.fill(line, tmp) + "\n" for line in lines)
+        expected = "".join(harness.fill(line, tmp, port) + "\n" for line in lines)
         got = entry.payload.decode("utf-8", "replace") if entry and entry.payload is not None else None
         checks.check(f"text:{path}", got == expected, f"expected {expected!r}, saved {got!r}")
 
@@ -237,7 +296,7 @@ def run_scenario(scenario: Scenario, program: str, base: str) -> bool:
                 os.chmod(path, stat.S_IMODE(mode))
                 raise SetupError(f"the edit changed the mode of {path} (put back)")
         checks.check("edit", done, edit_output)
-        check_saved(scenario, tmp, before, after, checks)
+        check_saved(scenario, tmp, port, before, after, checks)
 
         try:
             server.start()
@@ -245,9 +304,11 @@ def run_scenario(scenario: Scenario, program: str, base: str) -> bool:
             checks.check("after:start", False, f"{error} {greeting(port)}".strip())
         else:
             try:
-                check_server("after", scenario, tmp, port, checks)
+                logins = check_server("after", scenario, tmp, port, checks)
             finally:
                 server.stop()
+            if scenario.forecast:
+                check_forecast(scenario, REPORT, run_dir, logins, checks)
     except (SetupError, OSError) as error:
         print(f"{scenario.name:28} ERROR {error}")
         if edit_output:
@@ -290,6 +351,12 @@ def check_table(table: List[Scenario]) -> None:
             raise SystemExit(f"{where}: through is one of {THROUGH}")
         if scenario.through == "window" and scenario.edit[0] not in WINDOW_EDITS:
             raise SystemExit(f"{where}: the window makes only the edits {WINDOW_EDITS}")
+        if scenario.through == "engine" and scenario.edit[0] not in ENGINE_EDITS:
+            raise SystemExit(f"{where}: editchild makes only the edits {ENGINE_EDITS}")
+        if scenario.forecast and (not REPORT or set(scenario.forecast) - set(scenario.after)):
+            raise SystemExit(f"{where}: a forecast needs --report and users the after phase logs in")
+        if set(scenario.greeting) - {"before", "after"}:
+            raise SystemExit(f"{where}: a greeting is checked before or after the edit")
         # The engine checks the rights against the user's root and offers
         # to add the missing bits; the root of a user who is not chrooted
         # is "/", and the machine's "/" must never be offered.
@@ -305,22 +372,25 @@ def check_table(table: List[Scenario]) -> None:
             raise SystemExit(f"{where}: a known fault names the checks it fails")
 
 
-def take_window_option() -> Optional[str]:
-    """--window PROGRAM, taken off the command line before the harness reads
-    the options every script has."""
+def take_program_options() -> Tuple[Optional[str], Optional[str]]:
+    """--window PROGRAM and --report PROGRAM, taken off the command line
+    before the harness reads the options every script has."""
     parser = argparse.ArgumentParser(add_help=False)
     parser.add_argument("--window")
+    parser.add_argument("--report")
     known, rest = parser.parse_known_args(sys.argv[1:])
     sys.argv[1:] = rest
-    if known.window and not os.access(known.window, os.X_OK):
-        raise SystemExit(f"saves.py: {known.window} is not an executable program")
-    return known.window
+    for program in (known.window, known.report):
+        if program and not os.access(program, os.X_OK):
+            raise SystemExit(f"saves.py: {program} is not an executable program")
+    return known.window, known.report
 
 
 WINDOW: Optional[str] = None
+REPORT: Optional[str] = None
 
 if __name__ == "__main__":
-    WINDOW = take_window_option()
+    WINDOW, REPORT = take_program_options()
     tools = (harness.VSFTPD, harness.CHPASSWD, "unshare", "mount")
     defaults = {
         "uploads": [],
@@ -329,5 +399,7 @@ if __name__ == "__main__":
         "known_fault": "",
         "known_fault_checks": [],
         "through": "engine",
+        "forecast": [],
+        "greeting": {},
     }
     sys.exit(harness.main(__file__, __doc__, "--edit", tools, defaults, check_table, run_scenario))
