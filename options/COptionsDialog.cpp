@@ -17,6 +17,7 @@
 #include <QNetworkInterface>
 #include <QPushButton>
 #include <QRegularExpression>
+#include <QScrollBar>
 #include <QSettings>
 #include <QTextDocument>
 
@@ -171,10 +172,15 @@ COptionsDialog::COptionsDialog(FtpServerConfig &config, QWidget *parent)
     bindKeys();
     connectEditors();
 
+    // Every page title readable, however the splitter was left.
+    QListWidget *pages = m_ui->pagesListWidget;
+    pages->setMinimumWidth(pages->sizeHintForColumn(0) + 2 * pages->frameWidth()
+                           + pages->verticalScrollBar()->sizeHint().width());
     vexRestoreGeometry(this);
     const QByteArray splitterState = QSettings().value(splitterStateKey).toByteArray();
     if (splitterState.isEmpty() || !m_ui->pagesSplitter->restoreState(splitterState))
-        m_ui->pagesSplitter->setSizes({m_ui->pagesListWidget->sizeHintForColumn(0) + 24, width()});
+        m_ui->pagesSplitter->setSizes({pages->minimumWidth(), width()});
+    m_ui->pagesSplitter->setStretchFactor(1, 1);
 }
 
 COptionsDialog::~COptionsDialog() = default;
@@ -425,7 +431,12 @@ void COptionsDialog::connectEditors()
         QWidget *editor = file.list ? static_cast<QWidget *>(file.list) : file.textEdit;
         const QByteArray defaultPath = file.defaultPath;
         const auto follow = [editor, defaultPath](const QString &path) {
-            editor->setEnabled(QDir::isAbsolutePath(path.isEmpty() ? QString::fromUtf8(defaultPath) : path));
+            const bool oneFile = QDir::isAbsolutePath(path.isEmpty() ? QString::fromUtf8(defaultPath) : path);
+            editor->setEnabled(oneFile);
+            if (auto *text = qobject_cast<QPlainTextEdit *>(editor))
+                text->setPlaceholderText(oneFile ? QString()
+                                                 : tr("A relative name is looked up in each directory; give an "
+                                                      "absolute path to edit the file here."));
         };
         connect(file.pathEdit, &QLineEdit::textChanged, editor, follow);
         follow(file.pathEdit->text());

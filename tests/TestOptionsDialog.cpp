@@ -162,6 +162,8 @@ struct Opened
         before = engine.mainText();
         dialog = std::make_unique<COptionsDialog>(*engine.config);
         dialog->load();
+        // Not modal: the modal helper answers only the boxes it opens.
+        dialog->setWindowModality(Qt::NonModal);
         dialog->show();
         return true;
     }
@@ -577,6 +579,7 @@ private Q_SLOTS:
         opened.before = opened.engine.mainText();
         opened.dialog = std::make_unique<COptionsDialog>(*opened.engine.config);
         opened.dialog->load();
+        opened.dialog->setWindowModality(Qt::NonModal);
         opened.dialog->show();
 
         auto *listed = opened.child<QListWidget>(QStringLiteral("chrootUsersListWidget"));

@@ -3,7 +3,7 @@
 // the window with a refused user selected, its filter menu, the refusal box
 // of an edit that cannot be repaired, the Login check dock, the permissions
 // editor, then each dialog and box of the engine's questions, the way the
-// program shows them.
+// program shows them, and the options dialog page by page.
 #include "ModalHelper.h"
 #include "WindowFixture.h"
 #include "app/CMainWindow.h"
@@ -11,6 +11,7 @@
 #include "app/VexIntegration.h"
 #include "common/AppStrings.h"
 #include "dialogs/GuiInteraction.h"
+#include "options/COptionsDialog.h"
 #include "policy/FtpServerConfig.h"
 #include "usertable/CMainTreeView.h"
 #include "usertable/CUsersFilterProxyModel.h"
@@ -21,6 +22,7 @@
 #include <QApplication>
 #include <QDir>
 #include <QLineEdit>
+#include <QListWidget>
 #include <QMenu>
 #include <QPixmap>
 #include <QTest>
@@ -175,6 +177,24 @@ int main(int argc, char **argv)
     virtualUser.confirmationLineEdit()->setText(QStringLiteral("secret"));
     modal.expect(virtualUser.windowTitle(), shot(QStringLiteral("virtual-user-dialog"), QStringLiteral("Cancel")));
     virtualUser.run();
+
+    // The options dialog at the size it opens with, then each page at the
+    // smallest window size the program assumes.
+    modal.expect(QStringLiteral("Options"), [](QWidget *options) {
+        QTest::qWait(100);
+        save(options, QStringLiteral("options"));
+        options->resize(640, 480);
+        auto *pages = options->findChild<QListWidget *>(QStringLiteral("pagesListWidget"));
+        for (int page = 0; page < pages->count(); ++page) {
+            pages->setCurrentRow(page);
+            QTest::qWait(50);
+            save(options, QStringLiteral("options-%1").arg(page));
+        }
+        ModalHelper::press(options, QStringLiteral("Cancel"));
+    });
+    COptionsDialog options(model.config());
+    options.load();
+    options.exec();
 
     if (!modal.done()) {
         std::fprintf(stderr, "%s\n", qPrintable(modal.report()));
