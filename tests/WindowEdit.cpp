@@ -10,9 +10,10 @@
 // The options edit sets widgets of the options dialog by object name, each
 // on its page as the administrator turns to it, and must change every page:
 // "on"/"off" for check boxes, radio buttons and checkable group boxes, the
-// text of a line edit or of a combo entry, the number of a spin box; a push
-// button is clicked once per comma-separated piece of VALUE, the piece typed
-// into the input dialog it opens. Then OK.
+// text of a line or text edit or of a combo entry, the number of a spin box,
+// the comma-separated entries to select in a list; any other button is
+// clicked, with an empty VALUE once, otherwise once per comma-separated
+// piece, the piece typed into the input dialog it opens. Then OK.
 // Every box and dialog is answered the way editchild answers the engine:
 // with its accepting button; each one's text goes to stderr. Prints
 // "done saved" and exits 0 when the edit took and the save reported nothing.
@@ -41,6 +42,7 @@
 #include <QLineEdit>
 #include <QListWidget>
 #include <QMap>
+#include <QPlainTextEdit>
 #include <QPushButton>
 #include <QRadioButton>
 #include <QSet>
@@ -81,6 +83,14 @@ QString stateOf(const QWidget *widget)
         return group->isCheckable() ? onOff(group->isChecked()) : QString();
     if (auto *edit = qobject_cast<const QLineEdit *>(widget))
         return edit->text();
+    if (auto *edit = qobject_cast<const QPlainTextEdit *>(widget))
+        return edit->toPlainText();
+    if (auto *list = qobject_cast<const QListWidget *>(widget)) {
+        QStringList selected;
+        for (const QListWidgetItem *item : list->selectedItems())
+            selected << item->text();
+        return selected.join(QLatin1Char(','));
+    }
     if (auto *combo = qobject_cast<const QComboBox *>(widget))
         return combo->currentText();
     if (auto *spin = qobject_cast<const QSpinBox *>(widget))
@@ -102,6 +112,16 @@ void setState(QWidget *widget, const QString &value)
         edit->selectAll();
         QTest::keyClick(edit, Qt::Key_Delete);
         QTest::keyClicks(edit, value);
+    } else if (auto *text = qobject_cast<QPlainTextEdit *>(widget)) {
+        text->selectAll();
+        QTest::keyClick(text, Qt::Key_Delete);
+        QTest::keyClicks(text, value);
+    } else if (auto *list = qobject_cast<QListWidget *>(widget)) {
+        list->clearSelection();
+        for (const QString &entry : value.split(QLatin1Char(','))) {
+            for (QListWidgetItem *item : list->findItems(entry, Qt::MatchExactly))
+                item->setSelected(true);
+        }
     } else if (auto *combo = qobject_cast<QComboBox *>(widget)) {
         combo->setCurrentIndex(combo->findText(value));
     } else if (auto *spin = qobject_cast<QSpinBox *>(widget)) {
@@ -269,8 +289,10 @@ private:
             }
             const QString before = stateOf(widget);
             if (auto *button = qobject_cast<QAbstractButton *>(widget); button && before.isNull()) {
+                if (setting.value.isEmpty())
+                    button->click();
                 // A button that asks for what to add, once a piece.
-                for (const QString &piece : setting.value.split(QLatin1Char(','))) {
+                for (const QString &piece : setting.value.split(QLatin1Char(','), Qt::SkipEmptyParts)) {
                     m_inputs << piece;
                     button->click();
                 }
