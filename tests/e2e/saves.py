@@ -329,7 +329,9 @@ def run_scenario(scenario: Scenario, program: str, base: str) -> bool:
         outcome = f"FAIL: expected to fail {sorted(expected)}, failed: {describe(checks.failed, tmp)}"
     else:
         outcome = "ok" if ok else "FAIL: " + describe(checks.failed, tmp)
-    shown = ("window: " if scenario.through == "window" else "") + " ".join(edit).replace(tmp, "{tmp}")
+    # The options edit names a widget a setting: too many to show.
+    what = f"options ({len(edit) - 1} settings)" if edit[0] == "options" else " ".join(edit).replace(tmp, "{tmp}")
+    shown = ("window: " if scenario.through == "window" else "") + what
     print(f"{scenario.name:28} {shown:40} {checks.count:3} checks  {outcome}")
     if not ok and edit_output:
         print(f"{'':28} {os.path.basename(program)}: {edit_output}")
