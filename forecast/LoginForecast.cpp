@@ -177,18 +177,22 @@ void LoginForecast::checkServer()
     // The PAM service the server uses: the last pam_service_name, which is
     // the one the engine loaded unless the key is repeated.
     const QByteArray service = m_settings.value("pam_service_name", "vsftpd");
-    const ConfigFile *serviceFile = &m_config.pamConfig();
-    static const ConfigFile empty(SyntaxMode::TokenLine);
+    const ConfigFile *serviceFile = m_config.pamConfigExisted() ? &m_config.pamConfig() : nullptr;
     if (service != m_config.pamServiceName()) {
-        auto file = std::make_unique<ConfigFile>(SyntaxMode::TokenLine);
-        std::ifstream in(QFile::encodeName(root.resolve(QStringLiteral("/etc/pam.d/") + text(service))).toStdString(),
-                         std::ios::in | std::ios::binary);
-        if (in.is_open())
-            file->parse(in);
-        m_ownPam = std::move(file);
-        serviceFile = m_ownPam.get();
+        const QString path = root.resolve(QStringLiteral("/etc/pam.d/") + text(service));
+        std::ifstream in(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
+        serviceFile = nullptr;
+        if (in.is_open() && QFileInfo(path).isFile()) {
+            m_ownPam = std::make_unique<ConfigFile>(SyntaxMode::TokenLine);
+            m_ownPam->parse(in);
+            serviceFile = m_ownPam.get();
+        }
     }
-    m_pam = std::make_unique<PamForecast>(root, accounts, text(service), serviceFile ? *serviceFile : empty, m_today);
+    // vsftpd runs the session stack only when it opens PAM sessions.
+    m_pam = std::make_unique<PamForecast>(root, accounts, text(service), serviceFile,
+                                          m_settings.isYes("session_support", false), m_today);
+    for (const PamForecast::Note &note : m_pam->notes())
+        m_serverFindings.append({Severity::Warning, note.file, note.line, note.message});
 }
 
 bool LoginForecast::isListed(const QByteArray &login) const
@@ -440,8 +444,16 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
     // exists replaces it, one that does not is passed over.
     const std::function<QString()> homeWhat
         = [&] { return QStringLiteral("the home directory of %1").arg(text(account)); };
-    if (auto problem = checkRoot(account, record.home, false, true, true, homeWhat))
+    // pam_mkhomedir in the session stack makes a missing home before
+    // vsftpd changes into it.
+    if (m_pam->sessionMakesHome() && !m_config.pathStatus(record.home)) {
+        result.findings.append({Severity::Info, QStringLiteral("/etc/passwd"), 0,
+                                QStringLiteral("the home directory of %1 %2 does not exist: pam_mkhomedir makes it "
+                                               "when the session opens")
+                                    .arg(text(account), text(record.home))});
+    } else if (auto problem = checkRoot(account, record.home, false, true, true, homeWhat)) {
         return deny(QStringLiteral("/etc/passwd"), 0, problem->message);
+    }
     QByteArray root = record.home;
     std::function<QString()> rootWhat = homeWhat;
     if (const auto *localRoot = setting("local_root")) {

@@ -2,11 +2,15 @@
 
 #include "accounts/AccountStore.h"
 #include "accounts/VirtualUserDb.h"
+#include "policy/FtpServerConfig.h"
 
+#include <QDir>
 #include <QFile>
 #include <QFileInfo>
 
+#include <fnmatch.h>
 #include <fstream>
+#include <sys/stat.h>
 
 namespace {
 
@@ -18,8 +22,9 @@ struct ParsedAction
     int jump = 0;
 };
 
-const char *const CodeNames[] = {"success",          "auth_err",    "user_unknown", "authinfo_unavail", "acct_expired",
-                                 "new_authtok_reqd", "perm_denied", "ignore",       "service_err"};
+const char *const CodeNames[]
+    = {"success",          "auth_err",    "user_unknown", "authinfo_unavail", "acct_expired",
+       "new_authtok_reqd", "perm_denied", "ignore",       "service_err",      "module_unknown"};
 
 ParsedAction parseAction(const QByteArray &text)
 {
@@ -82,11 +87,12 @@ struct State
 } // namespace
 
 PamForecast::PamForecast(const RootDirectory &root, const AccountStore &accounts, const QString &service,
-                         const ConfigFile &serviceFile, QDate today)
+                         const ConfigFile *serviceFile, bool sessions, QDate today)
     : m_root(root)
     , m_accounts(accounts)
     , m_service(service)
     , m_serviceFile(serviceFile)
+    , m_sessions(sessions)
     , m_today(today)
 {
 }
@@ -112,18 +118,53 @@ const ConfigFile *PamForecast::includedFile(const QString &name)
     return it->second.get();
 }
 
-void PamForecast::expand(const ConfigFile &file, const QString &name, const QByteArray &facility, QList<Line> &out,
-                         int depth)
+bool PamForecast::moduleExists(const QByteArray &module)
+{
+    // A bare name is looked for where Debian's Linux-PAM keeps its modules.
+    // A root without that directory is no installed system: its modules
+    // are taken to be there rather than every line failing.
+    const QString directory = QFileInfo(QString::fromUtf8(FtpServerConfig::pamUserdbModule())).path();
+    if (!m_moduleDirectory)
+        m_moduleDirectory = QFileInfo(resolved(directory)).isDir();
+    if (!*m_moduleDirectory && !module.startsWith('/'))
+        return true;
+    auto it = m_modules.find(module);
+    if (it == m_modules.end()) {
+        const QString path = module.startsWith('/') ? QString::fromUtf8(module)
+                                                    : directory + QLatin1Char('/') + QString::fromUtf8(module);
+        it = m_modules.emplace(module, QFileInfo(resolved(path)).isFile()).first;
+    }
+    return it->second;
+}
+
+void PamForecast::expand(const ConfigFile &file, const QString &name, const QByteArray &facility,
+                         const QByteArray &requested, QList<Line> &out, int depth)
 {
     if (depth > 16)
         return;
+    const auto note = [this](const QString &where, int line, const QString &message) {
+        for (const Note &known : m_notes) {
+            if (known.file == where && known.line == line)
+                return;
+        }
+        m_notes.append({where, line, message});
+    };
     for (const auto &element : file.elements) {
         const int lineNumber = element->yOffset() + 1;
         if (element->type() == ElementType::Include) {
             const auto include = std::static_pointer_cast<ConfigElementInclude>(element);
             const QString target = QString::fromStdString(include->argument).trimmed();
-            if (const ConfigFile *included = includedFile(target))
-                expand(*included, QStringLiteral("/etc/pam.d/") + target, facility, out, depth + 1);
+            if (const ConfigFile *included = includedFile(target)) {
+                expand(*included, QStringLiteral("/etc/pam.d/") + target, facility, requested, out, depth + 1);
+            } else {
+                // Linux-PAM gives up on the whole service: pam_start fails.
+                const QString message = QStringLiteral("@include %1: the file does not exist, so pam_start fails and "
+                                                       "PAM refuses every login")
+                                            .arg(target);
+                note(name, lineNumber, message);
+                if (!m_startFails)
+                    m_startFails = Note{name, lineNumber, message};
+            }
             continue;
         }
         if (element->type() != ElementType::Expr)
@@ -137,12 +178,22 @@ void PamForecast::expand(const ConfigFile &file, const QString &name, const QByt
         QByteArray type = tokens.takeFirst();
         if (type.startsWith('-'))
             type = type.mid(1);
-        if (type != facility)
-            continue;
         Line line;
-        line.facility = facility;
         line.file = name;
         line.line = lineNumber;
+        if (type != "auth" && type != "account" && type != "session" && type != "password") {
+            // Linux-PAM installs a line of an unknown type as one that fails,
+            // in the most sensitive stack it was asked for.
+            if ((requested.isEmpty() ? QByteArray("auth") : requested) != facility)
+                continue;
+            line.broken = QStringLiteral("the line has the unknown type \"%1\", which Linux-PAM installs as a "
+                                         "failing auth line")
+                              .arg(QString::fromUtf8(type));
+            note(name, lineNumber, line.broken);
+        } else if (type != facility) {
+            continue;
+        }
+        line.facility = facility;
         QByteArray control = tokens.takeFirst();
         if (control.startsWith('[')) {
             QByteArray bracket = control;
@@ -153,11 +204,20 @@ void PamForecast::expand(const ConfigFile &file, const QString &name, const QByt
                 if (equals > 0)
                     line.actions.insert(pair.left(equals), pair.mid(equals + 1));
             }
-        } else if (control == "include" || control == "substack") {
+        } else if (line.broken.isEmpty() && (control == "include" || control == "substack")) {
             if (!tokens.isEmpty()) {
                 const QString target = QString::fromUtf8(tokens.first());
-                if (const ConfigFile *included = includedFile(target))
-                    expand(*included, QStringLiteral("/etc/pam.d/") + target, facility, out, depth + 1);
+                if (const ConfigFile *included = includedFile(target)) {
+                    expand(*included, QStringLiteral("/etc/pam.d/") + target, facility, facility, out, depth + 1);
+                    continue;
+                }
+                // What cannot be loaded stands as one failing line.
+                line.broken = QStringLiteral("%1 %2: the file does not exist, and Linux-PAM fails the %3 stack there")
+                                  .arg(QString::fromUtf8(control), target, QString::fromUtf8(facility));
+                note(name, lineNumber, line.broken);
+                line.actions.insert("default", "bad");
+                line.module = control;
+                out.append(line);
             }
             continue;
         } else {
@@ -165,10 +225,19 @@ void PamForecast::expand(const ConfigFile &file, const QString &name, const QByt
             if (line.actions.isEmpty())
                 line.actions.insert("default", "bad");
         }
+        if (!line.broken.isEmpty())
+            line.actions = {{"default", "bad"}};
         if (tokens.isEmpty())
             continue;
-        line.module = baseName(tokens.takeFirst());
+        const QByteArray module = tokens.takeFirst();
+        line.module = baseName(module);
         line.args = tokens;
+        if (line.broken.isEmpty() && !moduleExists(module)) {
+            line.missing = true;
+            note(name, lineNumber,
+                 QStringLiteral("the module %1 does not exist: Linux-PAM answers module_unknown for this line")
+                     .arg(QString::fromUtf8(module)));
+        }
         out.append(line);
     }
 }
@@ -178,7 +247,26 @@ QList<PamForecast::Line> PamForecast::stack(const QByteArray &facility)
     auto it = m_stacks.find(facility);
     if (it == m_stacks.end()) {
         QList<Line> lines;
-        expand(m_serviceFile, QStringLiteral("/etc/pam.d/") + m_service, facility, lines, 0);
+        const QString own = QStringLiteral("/etc/pam.d/") + m_service;
+        const QString other = QStringLiteral("/etc/pam.d/other");
+        const ConfigFile *fallback = m_service == QLatin1String("other") ? nullptr : includedFile(other);
+        if (m_serviceFile) {
+            expand(*m_serviceFile, own, facility, {}, lines, 0);
+            // A type the service's file has no line of is taken from "other".
+            if (lines.isEmpty() && fallback) {
+                expand(*fallback, other, facility, {}, lines, 0);
+                m_notes.append({own, 0,
+                                QStringLiteral("the file has no %1 line: Linux-PAM runs the %1 lines of %2")
+                                    .arg(QString::fromUtf8(facility), other)});
+            }
+        } else if (fallback) {
+            expand(*fallback, other, facility, {}, lines, 0);
+        } else if (!m_startFails) {
+            m_startFails = Note{own, 0,
+                                QStringLiteral("neither %1 nor %2 exists: pam_start fails and PAM refuses every login")
+                                    .arg(own, other)};
+            m_notes.append(*m_startFails);
+        }
         for (Line &line : lines) {
             for (int code = 0; code < CodeCount; ++code) {
                 const ParsedAction action
@@ -189,6 +277,33 @@ QList<PamForecast::Line> PamForecast::stack(const QByteArray &facility)
         it = m_stacks.emplace(facility, lines).first;
     }
     return it->second;
+}
+
+const QList<PamForecast::Note> &PamForecast::notes()
+{
+    if (!m_prepared) {
+        m_prepared = true;
+        if (!m_serviceFile && includedFile(QStringLiteral("other"))) {
+            m_notes.append({QStringLiteral("/etc/pam.d/") + m_service, 0,
+                            QStringLiteral("the PAM service file does not exist: Linux-PAM uses /etc/pam.d/other")});
+        }
+        stack("auth");
+        stack("account");
+        if (m_sessions)
+            stack("session");
+    }
+    return m_notes;
+}
+
+bool PamForecast::sessionMakesHome()
+{
+    if (!m_sessions)
+        return false;
+    for (const Line &line : stack("session")) {
+        if (line.module == "pam_mkhomedir.so" && !line.missing && line.broken.isEmpty())
+            return true;
+    }
+    return false;
 }
 
 std::optional<QList<QByteArray>> PamForecast::shadowFields(const QByteArray &user)
@@ -285,8 +400,16 @@ PamForecast::ModuleAnswer PamForecast::runListfile(const Line &line, const QByte
             return {Ignore, QString()};
     }
     QList<QByteArray> candidates;
-    if (item == "user") {
-        candidates << user;
+    if (item == "user" || item == "ruser") {
+        candidates << user; // vsftpd gives the login name as the remote user too
+    } else if (item == "tty") {
+        candidates << "ftp"; // what vsftpd sets
+    } else if (item == "rhost") {
+        return {std::nullopt,
+                QStringLiteral("pam_listfile with item=rhost (%1:%2), which depends on the client's "
+                               "address")
+                    .arg(line.file)
+                    .arg(line.line)};
     } else if (item == "group") {
         if (!known)
             return onError(QStringLiteral("the groups of %1 are unknown").arg(QString::fromUtf8(user)));
@@ -296,12 +419,15 @@ PamForecast::ModuleAnswer PamForecast::runListfile(const Line &line, const QByte
             return onError(QStringLiteral("the shell of %1 is unknown").arg(QString::fromUtf8(user)));
         candidates << account.shell;
     } else {
-        return {
-            std::nullopt,
-            QStringLiteral("pam_listfile with item=%1, which depends on the connection").arg(QString::fromUtf8(item))};
+        return onError(QStringLiteral("item=%1 is none that pam_listfile knows").arg(QString::fromUtf8(item)));
     }
     if (sense != "allow" && sense != "deny")
         return onError(QStringLiteral("sense=%1 is neither allow nor deny").arg(QString::fromUtf8(sense)));
+    if (!file.isEmpty() && untrusted(QString::fromUtf8(file)))
+        return {AuthErr,
+                QStringLiteral("the list %1 is writable by everybody or no plain file, and pam_listfile "
+                               "refuses")
+                    .arg(QString::fromUtf8(file))};
     const QHash<QByteArray, int> *entries = listEntries(file);
     if (!entries)
         return onError(QStringLiteral("the list %1 cannot be read").arg(QString::fromUtf8(file)));
@@ -340,6 +466,8 @@ const QHash<QByteArray, int> *PamForecast::listEntries(const QByteArray &file)
         if (!file.isEmpty() && QFileInfo(list).isFile() && list.open(QIODevice::ReadOnly)) {
             entries.emplace();
             int line = 0;
+            // As pam_listfile reads it: one "\r" before the line feed is
+            // dropped, blanks are not, empty lines name nobody.
             for (QByteArray entry : list.readAll().split('\n')) {
                 ++line;
                 if (entry.endsWith('\r'))
@@ -400,40 +528,382 @@ PamForecast::ModuleAnswer PamForecast::runUserdb(const Line &line, const QByteAr
 
 PamForecast::ModuleAnswer PamForecast::run(const Line &line, const QByteArray &user)
 {
-    if (line.module == "pam_permit.so")
+    if (!line.broken.isEmpty())
+        return {PermDenied, line.broken};
+    if (line.missing)
+        return {ModuleUnknown, QStringLiteral("the module %1 does not exist").arg(QString::fromUtf8(line.module))};
+    return runModule(line, user);
+}
+
+const QList<QByteArray> *PamForecast::fileLines(const QString &path)
+{
+    auto it = m_files.find(path);
+    if (it == m_files.end()) {
+        std::optional<QList<QByteArray>> lines;
+        QFile file(resolved(path));
+        if (QFileInfo(file).isFile() && file.open(QIODevice::ReadOnly)) {
+            // Only the line feed ends a line: a "\r" or a blank before it
+            // stays, as the modules read with fgets or getline.
+            lines = file.readAll().split('\n');
+            if (!lines->isEmpty() && lines->last().isEmpty())
+                lines->removeLast();
+        }
+        it = m_files.emplace(path, std::move(lines)).first;
+    }
+    return it->second ? &*it->second : nullptr;
+}
+
+bool PamForecast::untrusted(const QString &path)
+{
+    auto it = m_untrusted.find(path);
+    if (it == m_untrusted.end()) {
+        struct stat info;
+        const bool found = ::stat(QFile::encodeName(resolved(path)).constData(), &info) == 0;
+        it = m_untrusted.emplace(path, found && (!S_ISREG(info.st_mode) || (info.st_mode & S_IWOTH))).first;
+    }
+    return it->second;
+}
+
+const QStringList &PamForecast::dropIns(const QString &directory)
+{
+    auto it = m_dropIns.find(directory);
+    if (it == m_dropIns.end()) {
+        QStringList files;
+        const QDir listed(resolved(directory));
+        for (const QString &name : listed.entryList({QStringLiteral("*.conf")}, QDir::Files, QDir::Name))
+            files << directory + QLatin1Char('/') + name;
+        it = m_dropIns.emplace(directory, files).first;
+    }
+    return it->second;
+}
+
+PamForecast::ModuleAnswer PamForecast::runShells(const QByteArray &user)
+{
+    AccountRecord account;
+    if (!m_accounts.getUserInfo(user, account))
+        return {AuthErr,
+                QStringLiteral("there is no system account %1 to take a shell from").arg(QString::fromUtf8(user))};
+    const QString path = QStringLiteral("/etc/shells");
+    if (untrusted(path))
+        return {AuthErr,
+                QStringLiteral("/etc/shells is writable by everybody or no plain file, and pam_shells refuses")};
+    const QList<QByteArray> *lines = fileLines(path);
+    if (!lines)
+        return {AuthErr, QStringLiteral("/etc/shells cannot be read")};
+    // Whole lines: "/bin/bash " or "/bin/bash\r" is another shell.
+    if (!lines->contains(account.shell)) {
+        return {AuthErr,
+                QStringLiteral("the shell %1 is not listed in /etc/shells (pam_shells compares whole lines)")
+                    .arg(QString::fromUtf8(account.shell))};
+    }
+    return {Success, QString()};
+}
+
+PamForecast::ModuleAnswer PamForecast::runSucceedIf(const Line &line, const QByteArray &user)
+{
+    static const QSet<QByteArray> flags{"debug", "use_uid", "quiet", "quiet_fail", "quiet_success", "audit"};
+    QList<QByteArray> words;
+    for (const QByteArray &arg : line.args) {
+        if (!flags.contains(arg))
+            words << arg;
+    }
+    if (line.args.contains("use_uid"))
+        return {std::nullopt, QStringLiteral("pam_succeed_if with use_uid, which asks about the server's own account")};
+    if (words.size() % 3 != 0)
+        return {ServiceErr, QStringLiteral("pam_succeed_if has an incomplete condition")};
+    AccountRecord account;
+    const bool known = m_accounts.getUserInfo(user, account);
+    for (int i = 0; i < words.size(); i += 3) {
+        const QByteArray field = words[i].toLower();
+        const QByteArray op = words[i + 1].toLower();
+        const QByteArray &right = words[i + 2];
+        const QString condition
+            = QStringLiteral("\"%1 %2 %3\"")
+                  .arg(QString::fromUtf8(words[i]), QString::fromUtf8(words[i + 1]), QString::fromUtf8(right));
+        QByteArray left;
+        bool numeric = false;
+        if (field == "login" || field == "user" || field == "ruser") {
+            left = user; // vsftpd gives the login name as the remote user too
+        } else if (field == "tty") {
+            left = "ftp"; // what vsftpd sets
+        } else if (field == "service") {
+            left = m_service.toUtf8();
+        } else if (field == "rhost") {
+            return {
+                std::nullopt,
+                QStringLiteral("pam_succeed_if's condition %1, which depends on the client's address").arg(condition)};
+        } else if (field == "uid" || field == "gid" || field == "shell" || field == "home") {
+            if (!known)
+                return {UserUnknown,
+                        QStringLiteral("pam_succeed_if's condition %1 needs a system account %2")
+                            .arg(condition, QString::fromUtf8(user))};
+            numeric = field == "uid" || field == "gid";
+            left = field == "uid"  ? QByteArray::number(account.uid)
+                : field == "gid"   ? QByteArray::number(account.gid)
+                : field == "shell" ? account.shell
+                                   : account.home;
+        } else {
+            return {ServiceErr, QStringLiteral("pam_succeed_if does not know the field in %1").arg(condition)};
+        }
+        Q_UNUSED(numeric)
+        std::optional<bool> met;
+        const auto compare = [&](auto test) -> std::optional<bool> {
+            bool a = false;
+            bool b = false;
+            const qlonglong l = left.toLongLong(&a);
+            const qlonglong r = right.toLongLong(&b);
+            if (!a || !b)
+                return std::nullopt;
+            return test(l, r);
+        };
+        if (op == "<" || op == "lt")
+            met = compare([](qlonglong l, qlonglong r) { return l < r; });
+        else if (op == "<=" || op == "le")
+            met = compare([](qlonglong l, qlonglong r) { return l <= r; });
+        else if (op == ">" || op == "gt")
+            met = compare([](qlonglong l, qlonglong r) { return l > r; });
+        else if (op == ">=" || op == "ge")
+            met = compare([](qlonglong l, qlonglong r) { return l >= r; });
+        else if (op == "eq")
+            met = compare([](qlonglong l, qlonglong r) { return l == r; });
+        else if (op == "ne")
+            met = compare([](qlonglong l, qlonglong r) { return l != r; });
+        else if (op == "=")
+            met = left == right;
+        else if (op == "!=")
+            met = left != right;
+        else if (op == "=~" || op == "glob")
+            met = ::fnmatch(right.constData(), left.constData(), 0) == 0;
+        else if (op == "!~" || op == "noglob")
+            met = ::fnmatch(right.constData(), left.constData(), 0) != 0;
+        else if (op == "in" || op == "notin")
+            met = right.split(':').contains(left) == (op == "in");
+        else if (op == "ingroup" || op == "notingroup")
+            met = (known && m_accounts.isUserInGroup(user, right)) == (op == "ingroup");
+        else if (op == "innetgr" || op == "notinnetgr")
+            return {std::nullopt,
+                    QStringLiteral("pam_succeed_if's condition %1, which asks a netgroup").arg(condition)};
+        else
+            return {ServiceErr, QStringLiteral("pam_succeed_if does not know the test in %1").arg(condition)};
+        if (!met)
+            return {ServiceErr, QStringLiteral("pam_succeed_if's condition %1 compares no numbers").arg(condition)};
+        if (!*met)
+            return {AuthErr, QStringLiteral("pam_succeed_if's condition %1 is not met").arg(condition)};
+    }
+    return {Success, QString()};
+}
+
+PamForecast::ModuleAnswer PamForecast::runAccess(const Line &line, const QByteArray &user)
+{
+    QByteArray separator = argument(line.args, "fieldsep");
+    if (separator.isEmpty())
+        separator = ":";
+    const bool groupsByName = !line.args.contains("nodefgroup");
+    const QByteArray named = argument(line.args, "accessfile");
+    QStringList files{named.isEmpty() ? QStringLiteral("/etc/security/access.conf") : QString::fromUtf8(named)};
+    if (named.isEmpty()) {
+        // The drop-in files are read after the main one, in name order.
+        files << dropIns(QStringLiteral("/etc/security/access.d"));
+    }
+    AccountRecord account;
+    const bool known = m_accounts.getUserInfo(user, account);
+    // One name of the users field: yes, no, or none when it cannot be told.
+    const auto userToken = [&](const QByteArray &token) -> std::optional<bool> {
+        if (token.compare("ALL", Qt::CaseInsensitive) == 0)
+            return true;
+        if (token.startsWith('(') && token.endsWith(')'))
+            return known && m_accounts.isUserInGroup(user, token.mid(1, token.size() - 2));
+        if (token.contains('@'))
+            return std::nullopt; // a netgroup or a user at a host
+        if (token.compare(user, Qt::CaseInsensitive) == 0)
+            return true;
+        return groupsByName && known && m_accounts.isUserInGroup(user, token);
+    };
+    // The list with its EXCEPT parts, as pam_access walks it.
+    const std::function<std::optional<bool>(const QList<QByteArray> &, int)> listMatch
+        = [&](const QList<QByteArray> &tokens, int from) -> std::optional<bool> {
+        int i = from;
+        std::optional<bool> match = false;
+        for (; i < tokens.size() && tokens[i].compare("EXCEPT", Qt::CaseInsensitive) != 0; ++i) {
+            match = userToken(tokens[i]);
+            if (!match || *match)
+                break;
+        }
+        if (!match || !*match)
+            return match;
+        while (i < tokens.size() && tokens[i].compare("EXCEPT", Qt::CaseInsensitive) != 0)
+            ++i;
+        if (i >= tokens.size())
+            return true;
+        const std::optional<bool> except = listMatch(tokens, i + 1);
+        if (!except)
+            return std::nullopt;
+        return !*except;
+    };
+    for (const QString &path : files) {
+        const QList<QByteArray> *lines = fileLines(path);
+        if (!lines) {
+            if (path == files.first())
+                return {std::nullopt, QStringLiteral("pam_access, whose rules %1 cannot be read").arg(path)};
+            continue;
+        }
+        int number = 0;
+        for (const QByteArray &raw : *lines) {
+            ++number;
+            const QByteArray text = raw.trimmed();
+            if (text.isEmpty() || text.startsWith('#'))
+                continue;
+            const QList<QByteArray> fields = text.split(separator.at(0));
+            if (fields.size() != 3 || (fields[0].trimmed() != "+" && fields[0].trimmed() != "-"))
+                continue; // pam_access passes over a line it cannot read
+            const QString rule
+                = QStringLiteral("the rule \"%1\" (%2:%3)").arg(QString::fromUtf8(text), path).arg(number);
+            QList<QByteArray> users = fields[1].simplified().replace(',', ' ').split(' ');
+            users.removeAll(QByteArray());
+            const std::optional<bool> userMatch = listMatch(users, 0);
+            if (!userMatch)
+                return {std::nullopt, QStringLiteral("pam_access's %1, which names a netgroup or a host").arg(rule)};
+            if (!*userMatch)
+                continue;
+            if (fields[2].simplified().compare("ALL", Qt::CaseInsensitive) != 0)
+                return {std::nullopt,
+                        QStringLiteral("pam_access's %1, which depends on the client's address").arg(rule)};
+            if (fields[0].trimmed() == "+")
+                return {Success, QString()};
+            return {PermDenied, QStringLiteral("pam_access's %1 refuses").arg(rule)};
+        }
+    }
+    return {Success, QString()};
+}
+
+PamForecast::ModuleAnswer PamForecast::runTime(const QByteArray &user)
+{
+    const QString path = QStringLiteral("/etc/security/time.conf");
+    const QList<QByteArray> *lines = fileLines(path);
+    if (!lines)
+        return {std::nullopt, QStringLiteral("pam_time, whose rules %1 cannot be read").arg(path)};
+    // One field of a rule against one value: yes, no, or none when it
+    // holds a logic this forecast does not follow.
+    const auto matches = [](QByteArray field, const QByteArray &value) -> std::optional<bool> {
+        field = field.trimmed();
+        if (field.contains('&') || field.contains('|'))
+            return std::nullopt;
+        const bool negated = field.startsWith('!');
+        if (negated)
+            field = field.mid(1);
+        return (::fnmatch(field.constData(), value.constData(), 0) == 0) != negated;
+    };
+    int number = 0;
+    for (QByteArray text : *lines) {
+        ++number;
+        const int hash = text.indexOf('#');
+        if (hash >= 0)
+            text.truncate(hash);
+        text = text.trimmed();
+        if (text.isEmpty())
+            continue;
+        const QString rule = QStringLiteral("the rule \"%1\" (%2:%3)").arg(QString::fromUtf8(text), path).arg(number);
+        const QList<QByteArray> fields = text.split(';');
+        if (fields.size() != 4 || text.endsWith('\\'))
+            return {std::nullopt, QStringLiteral("pam_time's %1, which this forecast cannot read").arg(rule)};
+        bool applies = true;
+        const QByteArray values[] = {m_service.toUtf8(), QByteArray("ftp"), user};
+        for (int i = 0; i < 3 && applies; ++i) {
+            const std::optional<bool> match = matches(fields[i], values[i]);
+            if (!match)
+                return {std::nullopt, QStringLiteral("pam_time's %1, which this forecast cannot read").arg(rule)};
+            applies = *match;
+        }
+        if (!applies)
+            continue;
+        const QByteArray times = fields[3].trimmed();
+        if (times == "Al0000-2400")
+            continue;
+        if (times == "!Al0000-2400")
+            return {PermDenied, QStringLiteral("pam_time's %1 refuses at every hour").arg(rule)};
+        return {std::nullopt, QStringLiteral("pam_time's %1, which depends on the hour of the login").arg(rule)};
+    }
+    return {Success, QString()};
+}
+
+PamForecast::ModuleAnswer PamForecast::runLimits(const QByteArray &user)
+{
+    AccountRecord account;
+    if (!m_accounts.getUserInfo(user, account))
+        return {UserUnknown, QStringLiteral("pam_limits finds no system account %1").arg(QString::fromUtf8(user))};
+    QStringList files{QStringLiteral("/etc/security/limits.conf")};
+    files << dropIns(QStringLiteral("/etc/security/limits.d"));
+    // Limits are set and the session goes on; only a limit on the number
+    // of logins refuses, and that depends on the sessions already open.
+    for (const QString &path : files) {
+        const QList<QByteArray> *lines = fileLines(path);
+        int number = 0;
+        for (const QByteArray &raw : lines ? *lines : QList<QByteArray>()) {
+            ++number;
+            const QList<QByteArray> fields = raw.simplified().split(' ');
+            if (fields.size() < 4 || fields[0].startsWith('#'))
+                continue;
+            const QByteArray item = fields[2].toLower();
+            if (item != "maxlogins" && item != "maxsyslogins")
+                continue;
+            const QByteArray &domain = fields[0];
+            if (domain != "*" && !domain.startsWith('@') && !domain.startsWith('%') && !domain.contains(':')
+                && domain != user)
+                continue;
+            return {std::nullopt,
+                    QStringLiteral("pam_limits' rule \"%1\" (%2:%3), which depends on the sessions "
+                                   "already open")
+                        .arg(QString::fromUtf8(raw.simplified()), path)
+                        .arg(number)};
+        }
+    }
+    return {Success, QString()};
+}
+
+PamForecast::ModuleAnswer PamForecast::runModule(const Line &line, const QByteArray &user)
+{
+    const QByteArray &module = line.module;
+    const bool session = line.facility == "session";
+    if (module == "pam_permit.so")
         return {Success, QString()};
-    if (line.module == "pam_deny.so")
+    if (module == "pam_deny.so")
         return {AuthErr, QStringLiteral("pam_deny refuses everybody")};
-    if (line.module == "pam_unix.so")
+    if (module == "pam_unix.so") {
+        AccountRecord account;
+        if (session)
+            return m_accounts.getUserInfo(user, account)
+                ? ModuleAnswer{Success, QString()}
+                : ModuleAnswer{std::nullopt,
+                               QStringLiteral("pam_unix opening a session for %1, who has no system "
+                                              "account")
+                                   .arg(QString::fromUtf8(user))};
         return runUnix(line, user);
-    if (line.module == "pam_listfile.so")
+    }
+    if (module == "pam_listfile.so")
         return runListfile(line, user);
-    if (line.module == "pam_userdb.so")
+    if (module == "pam_userdb.so" && !session)
         return runUserdb(line, user);
-    if (line.module == "pam_shells.so") {
+    if (module == "pam_shells.so" && !session)
+        return runShells(user);
+    if (module == "pam_succeed_if.so")
+        return runSucceedIf(line, user);
+    if (module == "pam_access.so")
+        return runAccess(line, user);
+    if (module == "pam_time.so" && line.facility == "account")
+        return runTime(user);
+    if (module == "pam_limits.so" && session)
+        return runLimits(user);
+    if (module == "pam_env.so" && (session || line.facility == "auth"))
+        return {session ? Success : Ignore, QString()};
+    if ((module == "pam_loginuid.so" || module == "pam_mkhomedir.so") && session) {
         AccountRecord account;
         if (!m_accounts.getUserInfo(user, account))
-            return {AuthErr,
-                    QStringLiteral("there is no system account %1 to take a shell from").arg(QString::fromUtf8(user))};
-        if (!m_shells) {
-            QFile shells(resolved(QStringLiteral("/etc/shells")));
-            if (shells.open(QIODevice::ReadOnly)) {
-                m_shells.emplace();
-                for (const QByteArray &entry : shells.readAll().split('\n')) {
-                    if (!entry.trimmed().isEmpty() && !entry.startsWith('#'))
-                        m_shells->insert(entry.trimmed());
-                }
-            }
-        }
-        if (!m_shells)
-            return {AuthErr, QStringLiteral("/etc/shells cannot be read")};
-        if (!m_shells->contains(account.shell)) {
-            return {AuthErr,
-                    QStringLiteral("the shell %1 is not listed in /etc/shells").arg(QString::fromUtf8(account.shell))};
-        }
+            return {module == "pam_mkhomedir.so" ? UserUnknown : AuthErr,
+                    QStringLiteral("%1 finds no system account %2")
+                        .arg(QString::fromUtf8(module.left(module.size() - 3)), QString::fromUtf8(user))};
         return {Success, QString()};
     }
-    if (line.module == "pam_nologin.so") {
+    if (module == "pam_nologin.so" && !session) {
         // file= names the one file to look for instead of the usual ones.
         const QByteArray named = argument(line.args, "file");
         const QList<QByteArray> files
@@ -448,7 +918,7 @@ PamForecast::ModuleAnswer PamForecast::run(const Line &line, const QByteArray &u
         }
         return {Ignore, QString()};
     }
-    return {std::nullopt, QStringLiteral("%1, which this forecast does not model").arg(QString::fromUtf8(line.module))};
+    return {std::nullopt, QStringLiteral("%1, which this forecast does not model").arg(QString::fromUtf8(module))};
 }
 
 PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const QByteArray &user)
@@ -555,8 +1025,18 @@ PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const
 
 PamForecast::Result PamForecast::evaluate(const QByteArray &user)
 {
+    notes();
+    if (m_startFails)
+        return {Outcome::Failure, m_startFails->file, m_startFails->line, m_startFails->message};
     const Result auth = evaluateStack("auth", user);
     if (auth.outcome != Outcome::Success)
         return auth;
-    return evaluateStack("account", user);
+    const Result account = evaluateStack("account", user);
+    if (!m_sessions || account.outcome == Outcome::Failure)
+        return account;
+    // vsftpd opens the session last; its refusal ends the login as well.
+    const Result session = evaluateStack("session", user);
+    if (session.outcome != Outcome::Success)
+        return session;
+    return account;
 }

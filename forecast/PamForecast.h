@@ -18,12 +18,18 @@
 class AccountStore;
 
 // What Linux-PAM will answer for one user who types the right password,
-// from the service file and the files its modules read: the auth and the
-// account stacks, @include, the controls required, requisite, sufficient,
-// optional and "[value=action ...]", and the modules pam_unix, pam_shells,
-// pam_listfile, pam_userdb, pam_nologin, pam_deny and pam_permit. Any other
-// module may answer either way; the result is then unknown unless both
-// answers lead to the same end.
+// from the service file and the files its modules read, as vsftpd asks it:
+// the auth and the account stacks, and the session stack when vsftpd opens
+// sessions (session_support). Linux-PAM's own fallbacks are followed: a
+// missing service file and a type the file has no line of take
+// /etc/pam.d/other, a missing module fails its line, a missing @include
+// fails every login. Modelled: the controls required, requisite,
+// sufficient, optional and "[value=action ...]", and the modules pam_unix,
+// pam_shells, pam_listfile, pam_userdb, pam_nologin, pam_deny, pam_permit,
+// pam_succeed_if, pam_access, pam_time, pam_limits, pam_env, pam_loginuid
+// and pam_mkhomedir. Any other module, and a rule that depends on the
+// connection or the clock, may answer either way; the result is then
+// unknown unless both answers lead to the same end.
 class PamForecast
 {
 public:
@@ -37,12 +43,26 @@ public:
         QString message; // why, in a sentence
     };
 
-    PamForecast(const RootDirectory &root, const AccountStore &accounts, const QString &service,
-                const ConfigFile &serviceFile, QDate today = QDate::currentDate());
+    // What the service's files make of every login, said once: a file
+    // that is missing, a fallback Linux-PAM takes.
+    struct Note
+    {
+        QString file;
+        int line = 0;
+        QString message;
+    };
 
-    // "auth" then "account" for the login name.
+    // serviceFile is null when the service has no file of its own.
+    PamForecast(const RootDirectory &root, const AccountStore &accounts, const QString &service,
+                const ConfigFile *serviceFile, bool sessions, QDate today = QDate::currentDate());
+
+    // "auth", "account", then "session" when sessions are opened.
     Result evaluate(const QByteArray &user);
     Result evaluateStack(const QByteArray &facility, const QByteArray &user);
+    // Builds the stacks vsftpd runs and says what they fall back to.
+    const QList<Note> &notes();
+    // A session stack that holds pam_mkhomedir makes a missing home.
+    bool sessionMakesHome();
 
     // Codes a module answers with, by their names in "[value=action]".
     enum Code {
@@ -55,6 +75,7 @@ public:
         PermDenied,
         Ignore,
         ServiceErr,
+        ModuleUnknown,
         CodeCount
     };
 
@@ -70,6 +91,10 @@ private:
         std::array<std::pair<int, int>, CodeCount> parsedActions{};
         QString file;
         int line = 0;
+        // Not empty for a line Linux-PAM could not load: it fails as
+        // dispatched, whatever its module.
+        QString broken;
+        bool missing = false; // the module file does not exist
     };
 
     struct ModuleAnswer
@@ -79,9 +104,25 @@ private:
     };
 
     QList<Line> stack(const QByteArray &facility);
-    void expand(const ConfigFile &file, const QString &name, const QByteArray &facility, QList<Line> &out, int depth);
+    void expand(const ConfigFile &file, const QString &name, const QByteArray &facility, const QByteArray &requested,
+                QList<Line> &out, int depth);
     const ConfigFile *includedFile(const QString &name);
+    bool moduleExists(const QByteArray &module);
     ModuleAnswer run(const Line &line, const QByteArray &user);
+    ModuleAnswer runModule(const Line &line, const QByteArray &user);
+    ModuleAnswer runShells(const QByteArray &user);
+    ModuleAnswer runSucceedIf(const Line &line, const QByteArray &user);
+    ModuleAnswer runAccess(const Line &line, const QByteArray &user);
+    ModuleAnswer runTime(const QByteArray &user);
+    ModuleAnswer runLimits(const QByteArray &user);
+    // The lines of a file as Linux-PAM's modules read it, once a forecast;
+    // null when it cannot be read.
+    const QList<QByteArray> *fileLines(const QString &path);
+    // A file a module refuses to trust: not a plain file, or writable by
+    // everybody.
+    bool untrusted(const QString &path);
+    // The "*.conf" files of a drop-in directory, in name order.
+    const QStringList &dropIns(const QString &directory);
     ModuleAnswer runUnix(const Line &line, const QByteArray &user);
     ModuleAnswer runListfile(const Line &line, const QByteArray &user);
     ModuleAnswer runUserdb(const Line &line, const QByteArray &user);
@@ -95,13 +136,22 @@ private:
     RootDirectory m_root;
     const AccountStore &m_accounts;
     QString m_service;
-    const ConfigFile &m_serviceFile;
+    const ConfigFile *m_serviceFile;
+    bool m_sessions;
     QDate m_today;
+    QList<Note> m_notes;
+    bool m_prepared = false;
+    // Set when pam_start itself fails: every login is refused.
+    std::optional<Note> m_startFails;
+    std::map<QByteArray, bool> m_modules;
+    std::optional<bool> m_moduleDirectory;
+    std::map<QString, std::optional<QList<QByteArray>>> m_files;
+    std::map<QString, bool> m_untrusted;
+    std::map<QString, QStringList> m_dropIns;
     std::map<QString, std::unique_ptr<ConfigFile>> m_included;
     std::map<QByteArray, QList<Line>> m_stacks;
     // Lists and databases are read once per forecast, not once per user.
     std::map<QByteArray, std::optional<QHash<QByteArray, int>>> m_lists;
     std::map<QByteArray, std::optional<QSet<QByteArray>>> m_userdbs;
     std::optional<QHash<QByteArray, QList<QByteArray>>> m_shadow;
-    std::optional<QSet<QByteArray>> m_shells;
 };

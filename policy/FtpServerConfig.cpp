@@ -250,6 +250,11 @@ ConfigFile &FtpServerConfig::pamConfig()
     return m_pam;
 }
 
+bool FtpServerConfig::pamConfigExisted() const
+{
+    return m_pamConfigExisted;
+}
+
 const QByteArray &FtpServerConfig::pamServiceName() const
 {
     return m_pamServiceName;

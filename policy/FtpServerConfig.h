@@ -184,6 +184,9 @@ public:
     // was only assumed to be "listen=YES").
     bool mainConfigExisted() const;
     ConfigFile &pamConfig();
+    // False when the PAM service file was missing at load (read-only only:
+    // otherwise the load ends the process).
+    bool pamConfigExisted() const;
     const QByteArray &pamServiceName() const;
     const std::optional<FtpusersRule> &ftpusersRule() const;
     ConfigFile &ftpusersList();
@@ -245,6 +248,7 @@ private:
 
     ConfigFile m_main{SyntaxMode::KeyValue};
     bool m_mainConfigExisted = true;
+    bool m_pamConfigExisted = true;
     ConfigFile m_pam{SyntaxMode::TokenLine};
     QByteArray m_pamServiceName;
     std::optional<FtpusersRule> m_ftpusersRule;

@@ -72,6 +72,11 @@ void FtpServerConfig::loadPamConfig()
     const QString file = m_root.resolve(path);
     if (!QFileInfo(file).isFile()) {
         std::cout << QFile::encodeName(path).constData() << " not found" << std::endl;
+        m_pamConfigExisted = false;
+        // Read-only, the files are judged as they are: Linux-PAM itself
+        // goes on with /etc/pam.d/other, and the forecast says so.
+        if (m_mode == Mode::ReadOnly)
+            return;
         m_interaction.critical(tr("Initialization error"), tr("Unable to find %1").arg(path));
         m_interaction.exitProcess(-1);
     }
