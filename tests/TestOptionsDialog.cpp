@@ -10,6 +10,7 @@
 #include <QCheckBox>
 #include <QComboBox>
 #include <QDoubleSpinBox>
+#include <QFileDialog>
 #include <QGroupBox>
 #include <QInputDialog>
 #include <QLineEdit>
@@ -84,6 +85,8 @@ QString stateOf(QWidget *widget)
         return QString::number(spin->value());
     if (auto *edit = qobject_cast<QLineEdit *>(widget))
         return edit->text();
+    if (auto *text = qobject_cast<QPlainTextEdit *>(widget))
+        return text->toPlainText();
     if (auto *list = qobject_cast<QListWidget *>(widget)) {
         QStringList texts;
         for (int row = 0; row < list->count(); ++row)
@@ -628,6 +631,66 @@ private Q_SLOTS:
                  qPrintable(shown));
         QVERIFY(!failing.engine.root.exists(QStringLiteral("/no/such/dir/banner")));
         failing.dialog->reject();
+    }
+
+    // Each file chooser puts the chosen file, as the administrator knows
+    // it inside the root, into its line edit and loads its editor.
+    void choosers_data()
+    {
+        QTest::addColumn<QString>("button");
+        QTest::addColumn<QString>("title");
+        QTest::addColumn<bool>("startsAtPath");
+        QTest::addColumn<QString>("chosen");
+        QTest::addColumn<QString>("edit");
+        QTest::addColumn<QString>("editor");
+        QTest::addColumn<QString>("shown");
+        const auto row = [](const char *button, const char *title, bool startsAtPath, const char *chosen,
+                            const char *edit, const char *editor, const char *shown) {
+            QTest::newRow(button) << QString::fromUtf8(button) << QString::fromUtf8(title) << startsAtPath
+                                  << QString::fromUtf8(chosen) << QString::fromUtf8(edit) << QString::fromUtf8(editor)
+                                  << QString::fromUtf8(shown);
+        };
+        row("bannedEmailFileToolButton", "Select file with e-mail addresses", true, "/etc/other/emails",
+            "bannedEmailFileLineEdit", "emailsListWidget", "x@example.org");
+        row("chrootListFileToolButton", "Point to file", false, "/etc/other/chroot", "chrootListFileLineEdit",
+            "chrootUsersListWidget", "bob");
+        row("bannerFileToolButton", "Point to file", false, "/etc/other/banner", "bannerFileLineEdit",
+            "bannerFileTextEdit", "Hi\nthere");
+        row("messageFileToolButton", "Select per-directory message file", true, "/etc/other/message",
+            "messageFileLineEdit", "messageFileTextEdit", "Read me");
+    }
+    void choosers()
+    {
+        QFETCH(QString, button);
+        QFETCH(QString, title);
+        QFETCH(bool, startsAtPath);
+        QFETCH(QString, chosen);
+        QFETCH(QString, edit);
+        QFETCH(QString, editor);
+        QFETCH(QString, shown);
+        Opened opened;
+        const TemporaryRoot &root = opened.engine.root;
+        QVERIFY(opened.open({{conf,
+                              "listen=YES\ndeny_email_enable=YES\nchroot_list_enable=YES\n"
+                              "dirmessage_enable=YES\nmessage_file=/etc/vsftpd.message\n"
+                              "banner_file=/etc/vsftpd.banner\n"},
+                             {QStringLiteral("/etc/other/emails"), "x@example.org\n"},
+                             {QStringLiteral("/etc/other/chroot"), "bob\n"},
+                             {QStringLiteral("/etc/other/banner"), "Hi\nthere\n"},
+                             {QStringLiteral("/etc/other/message"), "Read me\n"}}));
+        ModalHelper modal;
+        modal.expect(title, [&](QWidget *dialog) {
+            auto *files = qobject_cast<QFileDialog *>(dialog);
+            QVERIFY(files);
+            if (startsAtPath)
+                QCOMPARE(files->directory().absolutePath(), root.filePath(QStringLiteral("/etc")));
+            files->findChild<QLineEdit *>(QStringLiteral("fileNameEdit"))->setText(root.filePath(chosen));
+            static_cast<QDialog *>(files)->accept(); // as its Open button does
+        });
+        opened.child<QToolButton>(button)->click();
+        QVERIFY2(modal.done(), qPrintable(modal.report()));
+        QCOMPARE(stateOf(opened.child(edit)), chosen);
+        QCOMPARE(stateOf(opened.child(editor)), shown);
     }
 
     // The window's Options action: accepted, the verdicts follow the new
