@@ -662,55 +662,63 @@ void COptionsDialog::warn(const QString &text)
     QMessageBox::warning(this, tr("Warning!"), text);
 }
 
-void COptionsDialog::addNewCommandListElement()
+void COptionsDialog::addListEntry(const QString &label, QListWidget *list, const QString &icon,
+                                  const std::function<std::optional<QString>(const QString &)> &refusal)
 {
     bool ok = false;
-    const QString command
-        = QInputDialog::getText(this, windowTitle(), tr("Enter allowed FTP command:"), QLineEdit::Normal, {}, &ok);
-    if (!ok || command.isEmpty())
+    const QString entry = QInputDialog::getText(this, windowTitle(), label, QLineEdit::Normal, {}, &ok);
+    if (!ok || entry.isEmpty())
         return;
-    // The list is one line of names split at commas.
-    if (command.contains(QLatin1Char(',')) || command.contains(QRegularExpression(QStringLiteral("[\\s[:cntrl:]]")))) {
-        warn(tr("Bad command name: %1").arg(command));
+    if (const auto why = refusal(entry)) {
+        warn(*why);
         return;
     }
-    if (!m_ui->commandsListWidget->findItems(command, Qt::MatchExactly).isEmpty())
+    // An entry listed twice allows or bans nothing more: the second is
+    // dropped without a word.
+    if (!list->findItems(entry, Qt::MatchExactly).isEmpty())
         return;
-    new QListWidgetItem(resourceIcon(QStringLiteral("ftp_command.png")), command, m_ui->commandsListWidget);
+    new QListWidgetItem(resourceIcon(icon), entry, list);
     updateButtons();
+}
+
+void COptionsDialog::deleteCurrent(QListWidget *list)
+{
+    delete list->takeItem(list->currentRow());
+    updateButtons();
+}
+
+void COptionsDialog::addNewCommandListElement()
+{
+    addListEntry(tr("Enter allowed FTP command:"), m_ui->commandsListWidget, QStringLiteral("ftp_command.png"),
+                 [](const QString &command) -> std::optional<QString> {
+                     // The list is one line of names split at commas.
+                     static const QRegularExpression separators(QStringLiteral("[,\\s[:cntrl:]]"));
+                     if (command.contains(separators))
+                         return tr("Bad command name: %1").arg(command);
+                     return std::nullopt;
+                 });
 }
 
 void COptionsDialog::deleteCommandListElement()
 {
-    delete m_ui->commandsListWidget->takeItem(m_ui->commandsListWidget->currentRow());
-    updateButtons();
+    deleteCurrent(m_ui->commandsListWidget);
 }
 
 void COptionsDialog::addNewEmailListElement()
 {
-    bool ok = false;
-    const QString address
-        = QInputDialog::getText(this, windowTitle(), tr("Enter email address:"), QLineEdit::Normal, {}, &ok);
-    if (!ok || address.isEmpty())
-        return;
-    static const QRegularExpression pattern(
-        QRegularExpression::anchoredPattern(QStringLiteral("\\b[^\\s@]+@[^\\s@]+\\.[^\\s@]+\\b")));
-    if (!pattern.match(address).hasMatch()) {
-        warn(tr("Bad email address: %1").arg(address));
-        return;
-    }
-    // An address listed twice bans nobody more: the second is dropped
-    // without a word, as a repeated command is.
-    if (!m_ui->emailsListWidget->findItems(address, Qt::MatchExactly).isEmpty())
-        return;
-    new QListWidgetItem(resourceIcon(QStringLiteral("email.png")), address, m_ui->emailsListWidget);
-    updateButtons();
+    addListEntry(tr("Enter email address:"), m_ui->emailsListWidget, QStringLiteral("email.png"),
+                 [](const QString &address) -> std::optional<QString> {
+                     static const QRegularExpression pattern(
+                         QRegularExpression::anchoredPattern(QStringLiteral("\\b[^\\s@]+@[^\\s@]+\\.[^\\s@]+\\b")));
+                     if (!pattern.match(address).hasMatch())
+                         return tr("Bad email address: %1").arg(address);
+                     return std::nullopt;
+                 });
 }
 
 void COptionsDialog::deleteEmailListElement()
 {
-    delete m_ui->emailsListWidget->takeItem(m_ui->emailsListWidget->currentRow());
-    updateButtons();
+    deleteCurrent(m_ui->emailsListWidget);
 }
 
 QString COptionsDialog::choosePath(const QString &title, const QString &startDirectory, const QString &filter)

@@ -92,6 +92,10 @@ private:
     void loadSideFile(const SideFile &file);
     void loadChrootLists();
     bool writeSideFiles();
+    // Asks for an entry and appends it unless refused or listed already.
+    void addListEntry(const QString &label, QListWidget *list, const QString &icon,
+                      const std::function<std::optional<QString>(const QString &)> &refusal);
+    void deleteCurrent(QListWidget *list);
     void moveSelected(QListWidget *from, QListWidget *to);
     QString choosePath(const QString &title, const QString &startDirectory, const QString &filter = QString());
     void warn(const QString &text);
