@@ -19,6 +19,7 @@
 #include <QPushButton>
 #include <QRadioButton>
 #include <QSpinBox>
+#include <QSplitter>
 #include <QToolButton>
 
 #include <sys/stat.h>
@@ -631,6 +632,24 @@ private Q_SLOTS:
                  qPrintable(shown));
         QVERIFY(!failing.engine.root.exists(QStringLiteral("/no/such/dir/banner")));
         failing.dialog->reject();
+    }
+
+    // The size and the splitter as the dialog was left, the next time.
+    void remembersLayout()
+    {
+        QSettings().clear();
+        for (const QSize size : {QSize(700, 500), QSize(600, 450)}) {
+            Opened opened;
+            QVERIFY(opened.open({{conf, "listen=YES\n"}}));
+            auto *splitter = opened.child<QSplitter>(QStringLiteral("pagesSplitter"));
+            if (size == QSize(600, 450)) {
+                QCOMPARE(opened.dialog->size(), QSize(700, 500));
+                QCOMPARE(splitter->sizes().first(), 250);
+            }
+            opened.dialog->resize(size);
+            splitter->setSizes({250, size.width() - 250});
+            opened.dialog->reject();
+        }
     }
 
     // Each file chooser puts the chosen file, as the administrator knows
