@@ -151,24 +151,42 @@ QByteArray FtpServerConfig::effectiveRoot(const QByteArray &user) const
 
 QByteArray FtpServerConfig::configuredRoot(const QByteArray &user) const
 {
-    if (const ConfigFile *own = userConfig(user)) {
-        if (const auto localRoot = findData(own->elements, "", "local_root"))
-            return QByteArray::fromStdString(localRoot->value);
-    }
     const auto homeOf = [this](const QByteArray &account) {
         AccountRecord record;
         return m_accounts && m_accounts->getUserInfo(account, record) ? record.home : QByteArray();
     };
+    const ConfigFile *own = userConfig(user);
+    const auto ownValue = [own](const char *key) -> std::optional<QByteArray> {
+        if (own) {
+            if (const auto data = findData(own->elements, "", key))
+                return QByteArray::fromStdString(data->value);
+        }
+        return std::nullopt;
+    };
     if (isAnonymousUser(user)) {
+        if (const auto localRoot = ownValue("local_root"))
+            return *localRoot;
         if (const auto anonRoot = mainValue("anon_root"))
             return *anonRoot;
         return homeOf(value("guest_username", "ftp"));
     }
-    if (const auto localRoot = mainValue("local_root"))
-        return *localRoot;
-    if (isVirtualUser(user) && isYes("guest_enable"))
-        return homeOf(value("guest_username", "ftp"));
-    return homeOf(user);
+    // The server puts the login name for user_sub_token into the home (the
+    // guest account's too) and into local_root, and enters a relative
+    // local_root from the home.
+    const QByteArray token = ownValue("user_sub_token").value_or(mainValue("user_sub_token").value_or(QByteArray()));
+    const auto expand = [&](QByteArray path) { return token.isEmpty() ? path : path.replace(token, user); };
+    const QByteArray home
+        = expand(isVirtualUser(user) && isYes("guest_enable") ? homeOf(value("guest_username", "ftp")) : homeOf(user));
+    std::optional<QByteArray> localRoot = ownValue("local_root");
+    if (!localRoot)
+        localRoot = mainValue("local_root");
+    if (localRoot) {
+        const QByteArray directory = expand(*localRoot);
+        if (directory.startsWith('/') || home.isEmpty())
+            return directory;
+        return home + (home.endsWith('/') ? "" : "/") + directory;
+    }
+    return home;
 }
 
 QList<QByteArray> FtpServerConfig::virtualUserNames() const
