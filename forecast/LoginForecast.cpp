@@ -7,6 +7,7 @@
 #include <QFile>
 #include <QFileInfo>
 
+#include <algorithm>
 #include <dirent.h>
 #include <fstream>
 #include <sys/stat.h>
@@ -155,12 +156,31 @@ void LoginForecast::checkServer()
               QStringLiteral("the account %1 (nopriv_user) does not exist: vsftpd ends every connection")
                   .arg(text(nopriv)));
     }
-    const QByteArray secure = m_settings.value("secure_chroot_dir", "/var/run/vsftpd/empty");
-    if (!QFileInfo(root.resolve(text(secure))).isDir()) {
-        error(m_mainPath, m_settings.line("secure_chroot_dir"),
-              QStringLiteral("the directory %1 (secure_chroot_dir) does not exist: vsftpd ends every connection")
-                  .arg(text(secure)));
+    checkSecureChrootDir();
+    if (m_settings.isYes("deny_email_enable", false)) {
+        // Read when a connection comes in, whether anonymous logins are on
+        // or not; a directory reads as an empty list.
+        const QByteArray banned = m_settings.value("banned_email_file", "/etc/vsftpd.banned_emails");
+        const QString path = root.resolve(text(banned));
+        QFile file(path);
+        if (QFileInfo(path).isDir()) {
+        } else if (file.open(QIODevice::ReadOnly)) {
+            // Whole lines, compared as they are: a "\r" or a blank at the
+            // end is part of the address.
+            m_bannedEmails = file.readAll().split('\n');
+            if (m_bannedEmails.constLast().isEmpty())
+                m_bannedEmails.removeLast();
+        } else {
+            error(m_mainPath,
+                  m_settings.line("banned_email_file") ? m_settings.line("banned_email_file")
+                                                       : m_settings.line("deny_email_enable"),
+                  QStringLiteral("deny_email_enable is on, but %1 (banned_email_file) cannot be read: vsftpd ends "
+                                 "every connection (cannot read anon e-mail list file)")
+                      .arg(text(banned)));
+        }
     }
+    if (m_settings.isYes("ssl_enable", false))
+        checkTls();
     if (m_settings.isYes("userlist_enable", false)) {
         m_userlistFile = m_settings.value("userlist_file", "/etc/vsftpd.user_list");
         m_userlist = readNames(root.resolve(text(m_userlistFile)));
@@ -193,6 +213,165 @@ void LoginForecast::checkServer()
                                           m_settings.isYes("session_support", false), m_today);
     for (const PamForecast::Note &note : m_pam->notes())
         m_serverFindings.append({Severity::Warning, note.file, note.line, note.message});
+}
+
+void LoginForecast::checkSecureChrootDir()
+{
+    // Every connection is chrooted there as nopriv_user before the login,
+    // with the same refusal of a root that account can write to.
+    const QByteArray secure = m_settings.value("secure_chroot_dir", "/var/run/vsftpd/empty");
+    const int line = m_settings.line("secure_chroot_dir");
+    const auto error = [&](const QString &message) {
+        m_serverFindings.append({Severity::Error, m_mainPath, line, message});
+        m_serverFails = true;
+    };
+    if (!secure.startsWith('/')) {
+        error(QStringLiteral("the directory %1 (secure_chroot_dir) is not an absolute path: vsftpd ends every "
+                             "connection (not found: directory given in 'secure_chroot_dir')")
+                  .arg(text(secure)));
+        return;
+    }
+    const auto status = m_config.pathStatus(secure);
+    if (!status || !S_ISDIR(status->st_mode)) {
+        error(QStringLiteral("the directory %1 (secure_chroot_dir) does not exist or is no directory: vsftpd ends "
+                             "every connection")
+                  .arg(text(secure)));
+        return;
+    }
+    const QByteArray nopriv = m_settings.value("nopriv_user", "nobody");
+    AccountRecord record;
+    if (!m_config.accounts().getUserInfo(nopriv, record))
+        return; // said already
+    const std::function<QString()> what = [&] { return QStringLiteral("the directory (secure_chroot_dir)"); };
+    if (auto problem = checkRoot(nopriv, secure, true, false, false, what)) {
+        error(QStringLiteral("the directory %1 (secure_chroot_dir) is writable by %2 (nopriv_user): vsftpd ends "
+                             "every connection (writable root inside chroot)")
+                  .arg(text(secure), text(nopriv)));
+    }
+}
+
+void LoginForecast::checkTls()
+{
+    const RootDirectory &root = m_config.root();
+    // What OpenSSL finds in a PEM file, as far as a look at it tells; the
+    // server reads it as root.
+    const auto check = [&](const QByteArray &key, const QByteArray &path, const QList<QByteArray> &markers,
+                           const QString &what, const QString &oops) -> bool {
+        const int line = m_settings.line(key) ? m_settings.line(key) : m_settings.line("ssl_enable");
+        const QString onDisk = root.resolve(text(path));
+        QFile file(onDisk);
+        const QString head = QStringLiteral("ssl_enable is on, but the %1 %2 (%3) ").arg(what, text(path), text(key));
+        if (!QFileInfo(onDisk).isFile()) {
+            m_serverFindings.append(
+                {Severity::Error, m_mainPath, line,
+                 head + QStringLiteral("does not exist or is no file: vsftpd does not start (%1)").arg(oops)});
+            m_serverFails = true;
+            return false;
+        } else if (!file.open(QIODevice::ReadOnly)) {
+            m_serverFindings.append(
+                {Severity::Warning, m_mainPath, line,
+                 head + QStringLiteral("cannot be read by this program: whether vsftpd can load it is not judged")});
+        } else {
+            const QByteArray content = file.readAll();
+            if (std::none_of(markers.begin(), markers.end(),
+                             [&](const QByteArray &m) { return content.contains(m); })) {
+                m_serverFindings.append(
+                    {Severity::Error, m_mainPath, line,
+                     head + QStringLiteral("holds no PEM %1: vsftpd does not start (%2)").arg(what, oops)});
+                m_serverFails = true;
+                return false;
+            } else if (content.contains("ENCRYPTED")) {
+                m_serverFindings.append(
+                    {Severity::Warning, m_mainPath, line,
+                     head + QStringLiteral("is encrypted: whether vsftpd can load it is not judged")});
+            }
+        }
+        return true;
+    };
+    const QByteArray certificate = m_settings.value("rsa_cert_file", "/usr/share/ssl/certs/vsftpd.pem");
+    // The server stops at the first file it cannot load.
+    if (!check("rsa_cert_file", certificate, {"-----BEGIN CERTIFICATE-----", "-----BEGIN TRUSTED CERTIFICATE-----"},
+               QStringLiteral("certificate"), QStringLiteral("SSL: cannot load RSA certificate")))
+        return;
+    // Without a key file of its own the key is looked for in the
+    // certificate's file.
+    if (m_settings.contains("rsa_private_key_file")) {
+        check("rsa_private_key_file", m_settings.value("rsa_private_key_file"), {"PRIVATE KEY-----"},
+              QStringLiteral("private key"), QStringLiteral("SSL: cannot load RSA private key"));
+    } else {
+        check("rsa_cert_file", certificate, {"PRIVATE KEY-----"}, QStringLiteral("private key"),
+              QStringLiteral("SSL: cannot load RSA private key"));
+    }
+    for (const char *key : {"ssl_sslv2", "ssl_sslv3", "ssl_tlsv1"}) {
+        if (m_settings.contains(QByteArray::fromRawData(key, int(qstrlen(key))))) {
+            m_serverFindings.append(
+                {Severity::Info, m_mainPath, m_settings.line(QByteArray::fromRawData(key, int(qstrlen(key)))),
+                 QStringLiteral("%1 does not change what a TLS client gets: with Debian 12's OpenSSL, vsftpd 3.0.3 "
+                                "accepts TLS 1.2 and 1.3 whatever ssl_sslv2, ssl_sslv3 and ssl_tlsv1 say, and "
+                                "refuses SSL 2, SSL 3, TLS 1.0 and 1.1")
+                     .arg(QString::fromLatin1(key))});
+            break;
+        }
+    }
+}
+
+UserForecast LoginForecast::withTls(UserForecast session, bool anonymous) const
+{
+    if (!m_settings.isYes("ssl_enable", false))
+        return session;
+    // Both checks come when the name is typed, before the userlist and PAM.
+    const QByteArray loginsKey = anonymous ? "force_anon_logins_ssl" : "force_local_logins_ssl";
+    const QByteArray dataKey = anonymous ? "force_anon_data_ssl" : "force_local_data_ssl";
+    // A local login on an anonymous-only server is refused before that.
+    const bool plainRefused
+        = m_settings.isYes(loginsKey, !anonymous) && (anonymous || m_settings.isYes("local_enable", false));
+    const bool dataForced = m_settings.isYes(dataKey, !anonymous);
+    const bool tlsRefused = anonymous && !m_settings.isYes("allow_anon_ssl", false) && !plainRefused;
+    const QString reason = session.findings.isEmpty() ? QString() : session.findings.constFirst().message;
+    const auto outcome = [&](const QString &client) -> ForecastFinding {
+        switch (session.status) {
+        case ForecastStatus::Allowed:
+            return {Severity::Info, QString(), 0, client + QStringLiteral(" logs in")};
+        case ForecastStatus::Denied:
+            return {Severity::Error, QString(), 0, client + QStringLiteral(" is refused: ") + reason};
+        case ForecastStatus::Unknown:
+            break;
+        }
+        return {Severity::Warning, QString(), 0, client + QStringLiteral(" may or may not log in: ") + reason};
+    };
+    const QString plainClient = QStringLiteral("a plain FTP client");
+    const QString tlsClient = QStringLiteral("a TLS client (AUTH TLS)");
+    ForecastFinding plain = outcome(plainClient);
+    if (plainRefused) {
+        plain = {Severity::Error, m_mainPath, m_settings.line(loginsKey),
+                 QStringLiteral("%1 is refused before its password: %2 is on, and vsftpd answers \"530 %3 sessions "
+                                "must use encryption.\"")
+                     .arg(plainClient, text(loginsKey),
+                          anonymous ? QStringLiteral("Anonymous") : QStringLiteral("Non-anonymous"))};
+    } else if (session.status == ForecastStatus::Allowed && dataForced) {
+        plain.file = m_mainPath;
+        plain.line = m_settings.line(dataKey);
+        plain.message += QStringLiteral(", but %1 is on: vsftpd refuses its data connections (no listing and no "
+                                        "transfer without TLS)")
+                             .arg(text(dataKey));
+    }
+    ForecastFinding tls = outcome(tlsClient);
+    if (tlsRefused) {
+        tls = {Severity::Error, m_mainPath, m_settings.line("allow_anon_ssl"),
+               QStringLiteral("%1 is refused before its password: allow_anon_ssl is off, and vsftpd answers \"530 "
+                              "Anonymous sessions may not use encryption.\"")
+                   .arg(tlsClient)};
+    }
+    UserForecast result;
+    result.status = plainRefused ? ForecastStatus::Denied : session.status;
+    // The plain client's finding decides the status; it comes first when it
+    // is the refusal, after the session's own otherwise.
+    if (plainRefused)
+        result.findings = {plain, tls};
+    result.findings += session.findings;
+    if (!plainRefused)
+        result.findings += {plain, tls};
+    return result;
 }
 
 bool LoginForecast::isListed(const QByteArray &login) const
@@ -300,8 +479,8 @@ UserForecast LoginForecast::userForecast(const QByteArray &user)
     // The table's anonymous row, and the names vsftpd itself takes for
     // anonymous logins while they are on.
     if (user == m_anonymousRow || (m_anonymousOn && (user == "anonymous" || user == "ftp")))
-        return forecastAnonymous();
-    return forecastLogin(user);
+        return withTls(forecastAnonymous(), true);
+    return withTls(forecastLogin(user), false);
 }
 
 UserForecast LoginForecast::forecastAnonymous()
@@ -347,7 +526,32 @@ UserForecast LoginForecast::forecastAnonymous()
         problem->line = anonRoot ? m_settings.line("anon_root") : 0;
         return UserForecast{ForecastStatus::Denied, {*problem}};
     }
-    return UserForecast{ForecastStatus::Allowed, {}};
+    UserForecast result{ForecastStatus::Allowed, {}};
+    // The ban depends on the password the client gives, which the forecast
+    // does not know: unknown, and the finding names the passwords refused.
+    if (m_settings.isYes("deny_email_enable", false) && !m_bannedEmails.isEmpty()) {
+        const int line = m_settings.line("deny_email_enable");
+        const QByteArray file = m_settings.value("banned_email_file", "/etc/vsftpd.banned_emails");
+        if (m_settings.isYes("no_anon_password", false)) {
+            result.findings.append({Severity::Info, m_mainPath, line,
+                                    QStringLiteral("deny_email_enable bans no one: no_anon_password is on, and vsftpd "
+                                                   "asks anonymous clients for no password")});
+        } else {
+            result.status = ForecastStatus::Unknown;
+            QStringList shown;
+            for (const QByteArray &address : m_bannedEmails)
+                shown.append(QLatin1Char('"') + text(address).replace(QLatin1Char('\r'), QLatin1String("\\r"))
+                             + QLatin1Char('"'));
+            result.findings.append(
+                {Severity::Warning, text(file), 0,
+                 QStringLiteral("deny_email_enable is on: vsftpd refuses an anonymous login whose password is one of "
+                                "the lines of this file, compared whole and case-sensitively (%1); any other "
+                                "password logs in")
+                     .arg(shown.size() > 5 ? shown.mid(0, 5).join(QLatin1String(", ")) + QStringLiteral(", ...")
+                                           : shown.join(QLatin1String(", ")))});
+        }
+    }
+    return result;
 }
 
 UserForecast LoginForecast::forecastLogin(const QByteArray &login)
@@ -442,25 +646,42 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
 
     // The session starts in the home of its account; a local_root that
     // exists replaces it, one that does not is passed over.
+    // user_sub_token stands for the name typed at login in the home (the
+    // guest account's too) and in local_root.
+    const QByteArray token = setting("user_sub_token") ? setting("user_sub_token")->value : QByteArray();
+    const auto expand = [&](QByteArray path) { return token.isEmpty() ? path : path.replace(token, login); };
+    const QByteArray home = expand(record.home);
     const std::function<QString()> homeWhat
         = [&] { return QStringLiteral("the home directory of %1").arg(text(account)); };
+    // passwd_chroot_enable: a confined session whose home holds "/./" is
+    // chrooted to the part before it, local_root and the home passed over.
+    const int jailEnd = home.indexOf("/./");
+    if (chrooted && jailEnd >= 0 && yes("passwd_chroot_enable", false)) {
+        const QByteArray jail = jailEnd == 0 ? QByteArray("/") : home.left(jailEnd);
+        const std::function<QString()> jailWhat = [&] {
+            return QStringLiteral("the chroot of %1 (its home up to \"/./\", passwd_chroot_enable)").arg(text(account));
+        };
+        if (auto problem = checkRoot(account, jail, true, yes("allow_writeable_chroot", false), true, jailWhat))
+            return deny(QStringLiteral("/etc/passwd"), 0, problem->message);
+        return result;
+    }
     // pam_mkhomedir in the session stack makes a missing home before
     // vsftpd changes into it.
-    if (m_pam->sessionMakesHome() && !m_config.pathStatus(record.home)) {
+    if (m_pam->sessionMakesHome() && !m_config.pathStatus(home)) {
         result.findings.append({Severity::Info, QStringLiteral("/etc/passwd"), 0,
                                 QStringLiteral("the home directory of %1 %2 does not exist: pam_mkhomedir makes it "
                                                "when the session opens")
-                                    .arg(text(account), text(record.home))});
-    } else if (auto problem = checkRoot(account, record.home, false, true, true, homeWhat)) {
+                                    .arg(text(account), text(home))});
+    } else if (auto problem = checkRoot(account, home, false, true, true, homeWhat)) {
         return deny(QStringLiteral("/etc/passwd"), 0, problem->message);
     }
-    QByteArray root = record.home;
+    QByteArray root = home;
     std::function<QString()> rootWhat = homeWhat;
     if (const auto *localRoot = setting("local_root")) {
-        QByteArray directory = localRoot->value;
-        const QByteArray token = setting("user_sub_token") ? setting("user_sub_token")->value : QByteArray();
-        if (!token.isEmpty())
-            directory.replace(token, login);
+        QByteArray directory = expand(localRoot->value);
+        // A relative local_root is entered from the home.
+        if (!directory.startsWith('/'))
+            directory = home + (home.endsWith('/') ? "" : "/") + directory;
         const auto status = m_config.pathStatus(directory);
         if (status && S_ISDIR(status->st_mode)) {
             root = directory;
@@ -472,14 +693,15 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
                                        "the session (cannot change directory)")
                             .arg(text(directory)));
         } else {
-            result.findings.append({Severity::Info, m_mainPath, localRoot->line,
+            const QString where = own && own->find("local_root") ? ownPath() : m_mainPath;
+            result.findings.append({Severity::Info, where, localRoot->line,
                                     QStringLiteral("local_root %1 does not exist: the session starts in %2")
-                                        .arg(text(directory), text(record.home))});
+                                        .arg(text(directory), text(home))});
         }
     }
     if (chrooted) {
         if (auto problem = checkRoot(account, root, true, yes("allow_writeable_chroot", false), true, rootWhat)) {
-            const bool fromPasswd = root == record.home;
+            const bool fromPasswd = root == home;
             return deny(fromPasswd ? QStringLiteral("/etc/passwd") : m_mainPath, 0, problem->message);
         }
     }

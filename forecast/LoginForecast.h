@@ -67,6 +67,12 @@ private:
                                              bool allowWriteable, bool mustEnter,
                                              const std::function<QString()> &what) const;
     const VsftpdSettings *userSettings(const QByteArray &login);
+    void checkTls();
+    void checkSecureChrootDir();
+    // What a plain FTP client and a TLS client get when ssl_enable is on:
+    // the session's own forecast is the TLS client's, the status the plain
+    // client's.
+    UserForecast withTls(UserForecast session, bool anonymous) const;
 
     FtpServerConfig &m_config;
     QDate m_today;
@@ -79,6 +85,8 @@ private:
     QByteArray m_userlistFile;
     std::optional<QSet<QByteArray>> m_userlist;
     QByteArray m_chrootListFile;
+    // The lines of banned_email_file when deny_email_enable is on.
+    QList<QByteArray> m_bannedEmails;
     std::optional<QSet<QByteArray>> m_chrootList;
     std::unique_ptr<ConfigFile> m_ownPam; // when the server's service is another
     std::unique_ptr<PamForecast> m_pam;

@@ -60,7 +60,22 @@ bool prepare(const FixtureRoot &root, const QString &setup)
         {QStringLiteral("ftpclosed"), [&] { return ::chmod(ftp.constData(), 0700) == 0; }},
         {QStringLiteral("ftpowned"), [&] { return ::chown(ftp.constData(), 107, 113) == 0; }},
     };
-    return setup.isEmpty() || (setups.contains(setup) && setups.value(setup)());
+    // Or commands, "; " between them: "mkdir PATH", "chmod MODE PATH",
+    // "chown UID:GID PATH".
+    for (const QString &command : setup.split(QStringLiteral("; "), Qt::SkipEmptyParts)) {
+        const QStringList words = command.split(QLatin1Char(' '));
+        const QByteArray path = QFile::encodeName(root.filePath(words.value(words.size() - 1)));
+        const QStringList ids = words.value(1).split(QLatin1Char(':'));
+        const bool done = setups.contains(command)                    ? setups.value(command)()
+            : words.size() == 2 && words[0] == QLatin1String("mkdir") ? root.makeDirectory(words[1])
+            : words.size() == 3 && words[0] == QLatin1String("chmod")
+            ? ::chmod(path.constData(), words[1].toUInt(nullptr, 8)) == 0
+            : words.size() == 3 && words[0] == QLatin1String("chown") && ids.size() == 2
+                && ::chown(path.constData(), ids[0].toUInt(), ids[1].toUInt()) == 0;
+        if (!done)
+            return false;
+    }
+    return true;
 }
 
 } // namespace
@@ -112,6 +127,15 @@ void TestLoginForecast::forecast()
     const UserForecast login = forecast.forecast(scenario.bytes(QStringLiteral("user")));
     const QString finding = scenario.value(QStringLiteral("finding"));
     QCOMPARE(first(login.findings).left(finding.size()), finding);
+    // Where ssl_enable is on, what a TLS client gets: the start of its finding.
+    if (scenario.has(QStringLiteral("tls"))) {
+        const auto tls = std::find_if(login.findings.begin(), login.findings.end(), [](const ForecastFinding &f) {
+            return f.message.startsWith(QLatin1String("a TLS client"));
+        });
+        QVERIFY(tls != login.findings.end());
+        QCOMPARE(tls->message.left(scenario.value(QStringLiteral("tls")).size()),
+                 scenario.value(QStringLiteral("tls")));
+    }
     static const QStringList statuses{QStringLiteral("allowed"), QStringLiteral("denied"), QStringLiteral("unknown")};
     QCOMPARE(statuses.value(static_cast<int>(login.status)), scenario.value(QStringLiteral("status")));
 }

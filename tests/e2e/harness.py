@@ -18,6 +18,7 @@ import os
 import shutil
 import signal
 import socket
+import ssl
 import stat
 import subprocess
 import sys
@@ -126,6 +127,9 @@ class Scenario:
         "files": {},  # path -> lines; root's, 0644, under /etc or {tmp}
         "dbs": {},  # database file (with ".db") -> {virtual user: password}
         "shadow": {},  # user -> {field number: value}, set after the accounts
+        # A certificate and its key made at set-up, {tmp}/cert.pem and
+        # {tmp}/key.pem, both in {tmp}/both.pem (never a committed key).
+        "certificate": False,
         "users": {},
     }
 
@@ -379,6 +383,15 @@ def prepare(scenario: Scenario, tmp: str, port: int) -> None:
     lists and databases."""
     os.makedirs(os.path.join(tmp, "empty"), 0o755, exist_ok=True)
     os.makedirs(os.path.join(tmp, "anon"), 0o755, exist_ok=True)
+    if scenario.certificate:
+        run_tool(
+            ["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-days", "2", "-subj", "/CN=127.0.0.1"]
+            + ["-keyout", os.path.join(tmp, "key.pem"), "-out", os.path.join(tmp, "cert.pem")]
+        )
+        with open(os.path.join(tmp, "both.pem"), "w", encoding="ascii") as both:
+            for name in ("cert.pem", "key.pem"):
+                with open(os.path.join(tmp, name), encoding="ascii") as part:
+                    both.write(part.read())
     add_accounts(scenario, tmp)
     EtcGuard.write(CONF, conf_text(scenario, tmp, port))
     for path, lines in COMMON_PAM.items():
@@ -547,8 +560,17 @@ def refusal(error: BaseException) -> str:
     return str(error) if isinstance(error, ftplib.error_perm) else f"connection closed: {error!r}"
 
 
+def tls_client() -> ftplib.FTP_TLS:
+    """A client that asks for TLS (AUTH TLS) before its login and takes any
+    certificate: the one of the test is made up."""
+    context = ssl.create_default_context()
+    context.check_hostname = False
+    context.verify_mode = ssl.CERT_NONE
+    return ftplib.FTP_TLS(context=context, timeout=FTP_TIMEOUT)
+
+
 def log_in(
-    port: int, user: str, password: str, greeting_may_refuse: bool = False
+    port: int, user: str, password: str, greeting_may_refuse: bool = False, tls: bool = False
 ) -> Tuple[Optional[ftplib.FTP], str]:
     """A session that said 230 and answers PWD, and the server's reply to
     the login; or None and the server's refusal.
@@ -557,7 +579,7 @@ def log_in(
     refuses too when `greeting_may_refuse` (one expected to fail);
     otherwise it proved at its start that it greets, and not reaching it
     is a fault of the run."""
-    ftp = ftplib.FTP(timeout=FTP_TIMEOUT)
+    ftp = tls_client() if tls else ftplib.FTP(timeout=FTP_TIMEOUT)
     session = None
     try:
         try:
@@ -569,9 +591,11 @@ def log_in(
         except (OSError, ftplib.Error) as error:
             raise SetupError(f"cannot connect to 127.0.0.1:{port}: {error}") from error
         try:
+            if tls:
+                ftp.auth()
             reply = ftp.login(user, password)
             ftp.pwd()
-        except (ftplib.error_perm,) + CLOSED as error:
+        except (ftplib.error_perm, ssl.SSLError) + CLOSED as error:
             return None, refusal(error)
         except (OSError, ftplib.Error) as error:
             raise SetupError(f"login of {user}: {error!r}") from error
@@ -590,9 +614,11 @@ def close(ftp: ftplib.FTP) -> None:
     ftp.close()
 
 
-def try_login(port: int, user: str, password: str, greeting_may_refuse: bool = False) -> Tuple[str, str]:
+def try_login(
+    port: int, user: str, password: str, greeting_may_refuse: bool = False, tls: bool = False
+) -> Tuple[str, str]:
     """(ALLOWED, the server's 230 reply) or (DENIED, its refusal): see log_in."""
-    ftp, reply = log_in(port, user, password, greeting_may_refuse)
+    ftp, reply = log_in(port, user, password, greeting_may_refuse, tls)
     if ftp is None:
         return DENIED, reply
     close(ftp)

@@ -62,13 +62,32 @@ def describe(findings) -> str:
     return "; ".join(f"{f.get('severity')} {f.get('file')}:{f.get('line')} {f.get('message')}" for f in shown)
 
 
+# A finding of the forecast about what a TLS client gets begins so, and goes
+# on with "logs in", "is refused" or (unknown) anything else.
+TLS_FINDING = "a TLS client (AUTH TLS) "
+
+
+def tls_forecast(findings) -> str:
+    """What the forecast says a TLS client gets: allowed, denied, unknown, or
+    "missing"."""
+    for finding in findings if isinstance(findings, list) else []:
+        message = finding.get("message", "") if isinstance(finding, dict) else ""
+        if message.startswith(TLS_FINDING):
+            rest = message[len(TLS_FINDING) :]
+            return ALLOWED if rest.startswith("logs in") else DENIED if rest.startswith("is refused") else UNKNOWN
+    return "missing"
+
+
 def log_in_everybody(scenario: Scenario, port: int) -> Tuple[Dict[str, Tuple[str, str]], List[str]]:
-    """Each user's login with the right password, and what went wrong with
+    """Each user's login with the right password (and, for a user that says
+    "tls", also as a TLS client, under "USER/tls"), and what went wrong with
     the wrong ones."""
     results: Dict[str, Tuple[str, str]] = {}
     problems: List[str] = []
     for user, expect in scenario.users.items():
         name, password = harness.credentials(scenario, user)
+        if "tls" in expect:
+            results[user + "/tls"] = harness.try_login(port, name, password, greeting_may_refuse=True, tls=True)
         results[user] = harness.try_login(port, name, password, greeting_may_refuse=True)
         if results[user][0] != ALLOWED or user == ANONYMOUS:
             continue
@@ -110,9 +129,12 @@ def check_server(scenario: Scenario, started: bool, log: str, results, document:
     return problems, findings, 1 if bug and not problems else 0
 
 
-def check_user(scenario: Scenario, user: str, row: Optional[dict], result, server_findings) -> Tuple[bool, int]:
+def check_user(
+    scenario: Scenario, user: str, row: Optional[dict], result, server_findings, tls_result=None
+) -> Tuple[bool, int]:
     """(passed, known faults seen) for one user: the server, the forecast
-    and, where the table gives it, the verdict."""
+    and, where the table gives it, the verdict; for a user that says "tls",
+    the TLS client's login and its finding too."""
     expect = scenario.users[user]
     actual, reply = result
     server, piece = split(expect["server"])
@@ -130,6 +152,19 @@ def check_user(scenario: Scenario, user: str, row: Optional[dict], result, serve
         notes += finding_problems(findings, "findings")
         if status not in (ALLOWED, DENIED, UNKNOWN) or (status == DENIED and not findings and not server_findings):
             notes.append(f"forecast status {status!r} without a finding")
+    tls = ""
+    if tls_result:
+        wanted, tls_piece = split(expect["tls"])
+        said = tls_forecast(findings)
+        if tls_result[0] != wanted:
+            notes.append(f"the server was expected to say {wanted} to a TLS client")
+        elif wanted == DENIED and tls_piece not in tls_result[1]:
+            notes.append(f"the server refused a TLS client for another reason than {tls_piece!r}")
+        elif said != tls_result[0]:
+            notes.append(f"the forecast says {said} for a TLS client, the server {tls_result[0]}")
+        tls = f" tls={tls_result[0]}"
+        if tls_result[0] == DENIED:
+            tls += f" [{tls_result[1].strip()}]"
     mark, why = split(expect.get("forecast", ""))
     bugs = 0
     outcome = "ok"
@@ -161,7 +196,7 @@ def check_user(scenario: Scenario, user: str, row: Optional[dict], result, serve
     detail = f" [server: {reply.strip()}]" if actual == DENIED else ""
     detail += f" [forecast: {describe(findings)}]" if findings else ""
     detail += f" [engine: {row.get('message')}]" if row and row.get("message") and verdict else ""
-    print(f"{scenario.name:36} {user:10} server={actual:8} forecast={status!s:8}{verdict} {outcome}{detail}")
+    print(f"{scenario.name:36} {user:10} server={actual:8} forecast={status!s:8}{verdict}{tls} {outcome}{detail}")
     return not notes, bugs
 
 
@@ -176,7 +211,11 @@ def run_scenario(scenario: Scenario, report: str, tmp: str) -> Tuple[bool, int]:
             results, problems = log_in_everybody(scenario, port) if started else ({}, [])
         finally:
             server.stop()
-        results = results or {user: (DENIED, f"vsftpd did not start: {server.log()}") for user in scenario.users}
+        results = results or {
+            name: (DENIED, f"vsftpd did not start: {server.log()}")
+            for user in scenario.users
+            for name in (user, user + "/tls")
+        }
         log = server.log()
         done = harness.run_report(report, tmp, "--json")
         table = harness.run_report(report, tmp).stdout if done.returncode == 0 else ""
@@ -196,7 +235,8 @@ def run_scenario(scenario: Scenario, report: str, tmp: str) -> Tuple[bool, int]:
     if refuses:
         if document is not None or refuses not in failure:
             problems.append(f"the report was expected to end with {refuses!r}: {failure or 'it ran'}")
-        for user, (actual, reply) in results.items():
+        for user in scenario.users:
+            actual, reply = results[user]
             server_says, piece = split(scenario.users[user]["server"])
             fine = actual == server_says and (actual == ALLOWED or piece in reply)
             passed &= fine
@@ -214,7 +254,14 @@ def run_scenario(scenario: Scenario, report: str, tmp: str) -> Tuple[bool, int]:
             status = ((rows.get(name) or {}).get("forecast") or {}).get("status")
             if shown.get(name) != status:
                 problems.append(f"{user}: the text table shows {shown.get(name)!r}, the JSON forecast {status!r}")
-            fine, seen = check_user(scenario, user, rows.get(name), results[user], server_findings)
+            fine, seen = check_user(
+                scenario,
+                user,
+                rows.get(name),
+                results[user],
+                server_findings,
+                results.get(user + "/tls") if "tls" in scenario.users[user] else None,
+            )
             passed &= fine
             bugs += seen
     for problem in problems:
@@ -237,6 +284,10 @@ def check_table(table: List[Scenario]) -> None:
                 raise SystemExit(f"{where}: the server says {ALLOWED} or {DENIED}, and only {DENIED} when it fails")
             if server == DENIED and not piece:
                 raise SystemExit(f"{where}: a refusal must name the server's answer")
+            if "tls" in expect and not scenario.certificate:
+                raise SystemExit(f"{where}: a TLS client needs the scenario's certificate")
+            if split(expect.get("tls", ALLOWED))[0] not in (ALLOWED, DENIED):
+                raise SystemExit(f"{where}: a TLS client is {ALLOWED} or {DENIED}")
             if split(expect.get("forecast", ""))[0] not in ("", "bug", UNKNOWN):
                 raise SystemExit(f"{where}: the forecast is either unknown or a known bug")
             if "report" not in expect:
