@@ -381,8 +381,9 @@ bool LoginForecast::isListed(const QByteArray &login) const
 
 const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
 {
-    // The server reads per-user files only when user_config_dir is set.
-    if (!m_settings.contains("user_config_dir"))
+    // The server reads per-user files only when user_config_dir is set, and
+    // never for a name with a "/".
+    if (!m_settings.contains("user_config_dir") || login.contains('/'))
         return nullptr;
     auto it = m_userFiles.find(login);
     if (it == m_userFiles.end()) {
@@ -405,15 +406,29 @@ const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
         }
         // A directory that cannot be listed is tried name by name; a name it
         // does not hold has no file, and nothing to remember.
-        if (m_userFileNames && !login.contains('/') && !m_userFileNames->contains(login))
+        if (m_userFileNames && !m_userFileNames->contains(login))
             return nullptr;
         std::unique_ptr<VsftpdSettings> settings;
         const QString path = m_config.root().resolve(text(directory + login));
-        std::ifstream in(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
-        if (in.is_open() && QFileInfo(path).isFile()) {
-            ConfigFile file(SyntaxMode::KeyValue);
-            file.parse(in);
-            settings = std::make_unique<VsftpdSettings>(file.elements);
+        struct stat info;
+        if (::stat(QFile::encodeName(path).constData(), &info) == 0) {
+            // The server reads it as root and ends the session on a file it
+            // does not trust, whatever it holds.
+            if (!S_ISREG(info.st_mode) || info.st_uid != 0) {
+                settings = std::make_unique<VsftpdSettings>(ConfigElementList());
+                settings->addError(0,
+                                   QStringLiteral("the per-user file %1: vsftpd ends the session (config file not "
+                                                  "owned by correct user, or not a file)")
+                                       .arg(S_ISDIR(info.st_mode) ? QStringLiteral("is a directory")
+                                                : !S_ISREG(info.st_mode)
+                                                ? QStringLiteral("is no plain file")
+                                                : QStringLiteral("belongs to uid %1, not root").arg(info.st_uid)));
+            } else {
+                std::ifstream in(QFile::encodeName(path).toStdString(), std::ios::in | std::ios::binary);
+                ConfigFile file(SyntaxMode::KeyValue);
+                file.parse(in);
+                settings = std::make_unique<VsftpdSettings>(file.elements);
+            }
         }
         it = m_userFiles.emplace(login, std::move(settings)).first;
     }
@@ -509,6 +524,13 @@ UserForecast LoginForecast::forecastAnonymous()
         }
     }
     const QByteArray account = m_settings.value("ftp_username", "ftp");
+    // An anonymous session reads the per-user file of ftp_username.
+    if (const VsftpdSettings *own = userSettings(account); own && !own->errors().isEmpty()) {
+        QByteArray directory = m_settings.value("user_config_dir");
+        if (!directory.endsWith('/'))
+            directory += '/';
+        return denied(text(directory + account), own->errors().first().line, own->errors().first().message);
+    }
     AccountRecord record;
     m_config.accounts().getUserInfo(account, record);
     const bool anonRoot = m_settings.contains("anon_root");
@@ -631,8 +653,10 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
     if (guest && !yes("virtual_use_local_privs", false)) {
         chrooted = true;
     } else {
-        chrooted = yes("chroot_local_user", false);
-        if (yes("chroot_list_enable", false)) {
+        // Decided before the per-user file is read: its chroot keys do
+        // nothing.
+        chrooted = m_settings.isYes("chroot_local_user", false);
+        if (m_settings.isYes("chroot_list_enable", false)) {
             if (!m_chrootList) {
                 return deny(m_mainPath, m_settings.line("chroot_list_enable"),
                             QStringLiteral("chroot_list_enable is on, but the chroot list %1 cannot be read: vsftpd "

@@ -158,9 +158,14 @@ VsftpdSettings::VsftpdSettings(const ConfigElementList &elements)
     const auto comment = [this](const ConfigElementPtr &element) {
         // vsftpd skips a comment only when "#" is the line's first character.
         if (element->xOffset() > 0) {
+            std::ostringstream text;
+            element->print(text);
+            const bool equals = text.str().find('=') != std::string::npos;
             m_errors.append({element->yOffset() + 1,
                              QStringLiteral("the comment is indented: vsftpd reads the line "
-                                            "as a setting and stops (unrecognised variable)")});
+                                            "as a setting and stops (%1)")
+                                 .arg(equals ? QStringLiteral("unrecognised variable")
+                                             : QStringLiteral("missing value in config file"))});
         }
     };
     for (const auto &element : elements) {
@@ -255,6 +260,11 @@ VsftpdSettings::Kind VsftpdSettings::kindOf(const QByteArray &key)
 const QList<VsftpdSettings::Problem> &VsftpdSettings::errors() const
 {
     return m_errors;
+}
+
+void VsftpdSettings::addError(int line, const QString &message)
+{
+    m_errors.append({line, message});
 }
 
 const QList<VsftpdSettings::Problem> &VsftpdSettings::repeats() const

@@ -37,8 +37,11 @@ public:
 
     static Kind kindOf(const QByteArray &key);
 
-    // Lines the server refuses to start with.
+    // Lines the server refuses to start with (for a per-user file: with
+    // which it ends the session).
     const QList<Problem> &errors() const;
+    // What stops the server before any line is read.
+    void addError(int line, const QString &message);
     // Keys set more than once: the server takes the last value.
     const QList<Problem> &repeats() const;
 
