@@ -21,19 +21,17 @@ QString text(const QByteArray &bytes)
     return QString::fromUtf8(bytes);
 }
 
-// The lines of a list file, read once: each login is compared with whole
-// lines, case-sensitively, a "\r" before the line end not counted.
+// The lines of a list file, read once: vsftpd compares each login with
+// whole lines, case-sensitively; a "\r" or a blank before the line end is
+// part of the line, and "bob\r" does not name bob.
 std::optional<QSet<QByteArray>> readNames(const QString &path)
 {
     QFile file(path);
     if (!QFileInfo(path).isFile() || !file.open(QIODevice::ReadOnly))
         return std::nullopt;
     QSet<QByteArray> names;
-    for (QByteArray line : file.readAll().split('\n')) {
-        if (line.endsWith('\r'))
-            line.chop(1);
+    for (const QByteArray &line : file.readAll().split('\n'))
         names.insert(line);
-    }
     return names;
 }
 

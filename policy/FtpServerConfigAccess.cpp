@@ -339,8 +339,13 @@ bool FtpServerConfig::ftpusersListed(const QByteArray &name)
         for (const auto &element : m_ftpusers.elements) {
             if (element->type() != ElementType::Expr)
                 continue;
-            for (const auto &token : std::static_pointer_cast<ConfigElementExpr>(element)->tokens)
-                m_ftpusersIndex.insert(QByteArray::fromStdString(token.text));
+            for (const auto &token : std::static_pointer_cast<ConfigElementExpr>(element)->tokens) {
+                // pam_listfile drops a "\r" before the line end: "bob\r" lists bob.
+                QByteArray name = QByteArray::fromStdString(token.text);
+                if (name.endsWith('\r'))
+                    name.chop(1);
+                m_ftpusersIndex.insert(name);
+            }
         }
         m_ftpusersIndexValid = true;
     }

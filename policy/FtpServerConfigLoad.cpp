@@ -92,7 +92,12 @@ QStringList FtpServerConfig::readNameList(const QByteArray &path) const
     if (!file.open(QIODevice::ReadOnly))
         return names;
     while (!file.atEnd()) {
-        const QString name = QString::fromUtf8(file.readLine()).simplified();
+        QByteArray line = file.readLine();
+        if (line.endsWith('\n'))
+            line.chop(1);
+        // vsftpd compares whole lines: one that ends in "\r" names nobody,
+        // and is kept as it is rather than simplified into a name.
+        const QString name = line.endsWith('\r') ? QString::fromUtf8(line) : QString::fromUtf8(line).simplified();
         // An empty line names nobody; dropping it keeps the list's meaning.
         if (!name.isEmpty())
             names.append(name);
