@@ -125,7 +125,8 @@ bool FtpServerConfig::isVirtualUser(const QByteArray &user) const
 
 FtpServerConfig::UserlistMode FtpServerConfig::userlistMode() const
 {
-    if (value("userlist_enable", "yes").toLower() == "no")
+    const std::optional<QByteArray> enabled = mainValue(QByteArrayLiteral("userlist_enable"));
+    if (enabled && enabled->compare("no", Qt::CaseInsensitive) == 0)
         return UserlistMode::Off;
     return isYes("userlist_deny", true) ? UserlistMode::Deny : UserlistMode::Allow;
 }
@@ -146,7 +147,16 @@ bool FtpServerConfig::isChrooted(const QByteArray &user) const
 
 QByteArray FtpServerConfig::effectiveRoot(const QByteArray &user) const
 {
-    return isChrooted(user) ? configuredRoot(user) : QByteArray("/");
+    // Asked twice in a row for the same user (the check, then the row that
+    // shows it): within a pass the second answer is the first.
+    if (m_pass && m_pass->rootUser == user && !user.isEmpty())
+        return m_pass->root;
+    QByteArray root = isChrooted(user) ? configuredRoot(user) : QByteArrayLiteral("/");
+    if (m_pass) {
+        m_pass->rootUser = user;
+        m_pass->root = root;
+    }
+    return root;
 }
 
 QByteArray FtpServerConfig::configuredRoot(const QByteArray &user) const

@@ -277,6 +277,9 @@ private:
     {
         QHash<QString, std::optional<struct stat>> metadata;
         QHash<QByteArray, std::optional<struct stat>> paths;
+        // The last user's effective root.
+        QByteArray rootUser;
+        QByteArray root;
         QHash<QByteArray, std::optional<QByteArray>> values;
     };
     mutable std::unique_ptr<PassCache> m_pass;

@@ -92,7 +92,7 @@ bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, A
             QByteArray path = QByteArray::fromStdString(argument->text.substr(3));
             if (!path.isEmpty() && !path.endsWith(".db"))
                 path += ".db";
-            if (fileStatus(resolved(path)))
+            if (pathStatus(path))
                 continue;
             if (!interactive) {
                 refuse(failure, FailureKind::PamUserDb,

@@ -62,7 +62,7 @@ QStringList FtpServerConfig::userRights(const QByteArray &user) const
     const ConfigFile *own = isAnonymousUser(user) ? nullptr : userConfig(user);
     // A per-user file overrides the main configuration, which overrides the
     // server's defaults.
-    const auto yes = [&](const char *key, bool serverDefault) {
+    const auto yes = [&](const auto &key, bool serverDefault) {
         if (own) {
             if (const auto data = findData(own->elements, "", key))
                 return QByteArray::fromStdString(data->value).toLower() == "yes";
