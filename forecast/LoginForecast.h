@@ -69,6 +69,7 @@ private:
     const VsftpdSettings *userSettings(const QByteArray &login);
     void checkTls();
     void checkSecureChrootDir();
+    void checkUserdbFile(const QByteArray &service, const ConfigFile *serviceFile);
     // What a plain FTP client and a TLS client get when ssl_enable is on:
     // the session's own forecast is the TLS client's, the status the plain
     // client's.

@@ -63,6 +63,9 @@ public:
     const QList<Note> &notes();
     // A session stack that holds pam_mkhomedir makes a missing home.
     bool sessionMakesHome();
+    // The names in the database file pam_userdb opens (its path with
+    // ".db"), read once; null when it cannot be opened.
+    const QSet<QByteArray> *userdbKeys(const QByteArray &path);
 
     // Codes a module answers with, by their names in "[value=action]".
     enum Code {
@@ -129,7 +132,6 @@ private:
     // The entries of a pam_listfile list, each with the line it first
     // appears on; null when the file cannot be read.
     const QHash<QByteArray, int> *listEntries(const QByteArray &file);
-    const QSet<QByteArray> *userdbKeys(const QByteArray &path);
     std::optional<QList<QByteArray>> shadowFields(const QByteArray &user);
     QString resolved(const QString &path) const;
 
