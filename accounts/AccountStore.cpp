@@ -250,6 +250,14 @@ bool AccountStore::isVirtualUser(const QByteArray &name) const
     return m_virtualNames.contains(name);
 }
 
+std::optional<QByteArray> AccountStore::livePassword(const QByteArray &name) const
+{
+    const auto found = m_virtualUsers.find(name);
+    if (found == m_virtualUsers.end() || found->second.state == VirtualUserState::Deleted)
+        return std::nullopt;
+    return found->second.password;
+}
+
 void AccountStore::addVirtualUser(const QByteArray &name, const QByteArray &password)
 {
     m_virtualUsersChanged = true;

@@ -67,6 +67,9 @@ public:
     // Virtual users: edits stay in memory until syncVirtualUsers().
     void loadVirtualUsers(const QByteArray &path);
     bool isVirtualUser(const QByteArray &name) const;
+    // A virtual user that is still there: a deleted one waits for the save
+    // and may be added again. Its password, or nothing.
+    std::optional<QByteArray> livePassword(const QByteArray &name) const;
     void addVirtualUser(const QByteArray &name, const QByteArray &password);
     void changeVirtualUser(const QByteArray &oldName, const QByteArray &newName, const QByteArray &password);
     void removeVirtualUser(const QByteArray &name);

@@ -327,15 +327,9 @@ QModelIndex CMainWindow::currentSourceIndex() const
 
 namespace {
 
-// A virtual user that is still there: a deleted one waits for the save and
-// may be added again. Its password, or nothing.
 std::optional<QByteArray> livePassword(const FtpServerConfig &config, const QByteArray &name)
 {
-    const auto &users = config.accounts().virtualUsers();
-    const auto found = users.find(name);
-    if (found == users.end() || found->second.state == VirtualUserState::Deleted)
-        return std::nullopt;
-    return found->second.password;
+    return config.accounts().livePassword(name);
 }
 
 } // namespace

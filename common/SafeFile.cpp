@@ -116,8 +116,10 @@ void discard(AtomicBatch::Pending &file, const char *what, int error)
 }
 
 // The temporary file of a target, written but not yet synced.
+// The mode and owner given replace those of an existing target (a backup
+// takes its original's, whatever an older backup had).
 void prepare(AtomicBatch::Pending &file, const QString &linkPath, const QByteArray &content, mode_t newFileMode,
-             const QString &trustedTop)
+             const QString &trustedTop, std::optional<std::pair<uid_t, gid_t>> forcedOwner = std::nullopt)
 {
     // A link root made is kept, and the file it leads to is replaced.
     QString path;
@@ -138,11 +140,13 @@ void prepare(AtomicBatch::Pending &file, const QString &linkPath, const QByteArr
             file.error = systemError("the target is a directory", EISDIR);
             return;
         }
-        if (S_ISREG(existing.st_mode)) {
+        if (S_ISREG(existing.st_mode) && !forcedOwner) {
             mode = existing.st_mode & 07777;
             owner = std::make_pair(existing.st_uid, existing.st_gid);
         }
     }
+    if (forcedOwner)
+        owner = forcedOwner;
 
     file.temporary
         = QFile::encodeName(info.absolutePath()) + "/." + QFile::encodeName(info.fileName()) + ".ftpconfig-XXXXXX";
@@ -210,6 +214,53 @@ std::optional<QString> AtomicBatch::add(const QString &path, const QByteArray &c
     return file.error;
 }
 
+std::optional<QString> AtomicBatch::addBackup(const QString &path, const QString &trustedTop,
+                                              std::optional<mode_t> keptMode)
+{
+    QString original;
+    std::optional<QString> refused = linkTarget(path, QDir::cleanPath(trustedTop), original);
+    QByteArray content;
+    struct stat info
+    {
+    };
+    if (!refused) {
+        // Read without following a link planted after the check: the copy
+        // is of the file the save is about to replace, or of nothing.
+        const int fd = ::open(QFile::encodeName(original).constData(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC);
+        if (fd < 0 || ::fstat(fd, &info) != 0 || !S_ISREG(info.st_mode)) {
+            refused = systemError("cannot read the file to keep", fd < 0 ? errno : EINVAL);
+        } else {
+            char buffer[65536];
+            ssize_t got;
+            while ((got = ::read(fd, buffer, sizeof buffer)) != 0) {
+                if (got < 0 && errno == EINTR)
+                    continue;
+                if (got < 0) {
+                    refused = systemError("cannot read the file to keep", errno);
+                    break;
+                }
+                content.append(buffer, static_cast<int>(got));
+            }
+        }
+        if (fd >= 0)
+            ::close(fd);
+    }
+    if (refused) {
+        m_files.emplace_back();
+        m_files.back().error = refused;
+        return refused;
+    }
+    if (m_open == MaxOpenFiles)
+        syncOpenFiles();
+    m_files.emplace_back();
+    Pending &file = m_files.back();
+    prepare(file, backupPath(path), content, keptMode.value_or(info.st_mode & 07777), trustedTop,
+            std::make_pair(info.st_uid, info.st_gid));
+    if (file.fd >= 0)
+        ++m_open;
+    return file.error;
+}
+
 void AtomicBatch::syncOpenFiles()
 {
     // Writeback of every file is started before the first wait, so that
@@ -270,6 +321,19 @@ std::optional<QString> writeFileAtomically(const QString &path, const QByteArray
 {
     AtomicBatch batch;
     if (const auto refused = batch.add(path, content, newFileMode, trustedTop))
+        return refused;
+    return batch.commit().front();
+}
+
+QString backupPath(const QString &path)
+{
+    return path + QStringLiteral(".ftpconfig-bak");
+}
+
+std::optional<QString> writeBackup(const QString &path, const QString &trustedTop, std::optional<mode_t> keptMode)
+{
+    AtomicBatch batch;
+    if (const auto refused = batch.addBackup(path, trustedTop, keptMode))
         return refused;
     return batch.commit().front();
 }

@@ -40,6 +40,11 @@ public:
     // otherwise why not: the target is then left alone by commit().
     std::optional<QString> add(const QString &path, const QByteArray &content, mode_t newFileMode = 0644,
                                const QString &trustedTop = QStringLiteral("/"));
+    // The temporary file of backupPath(path): a copy of the file at path
+    // (through a link root made, as a write would follow it), with the
+    // original's mode, or keptMode when given, and its owner.
+    std::optional<QString> addBackup(const QString &path, const QString &trustedTop = QStringLiteral("/"),
+                                     std::optional<mode_t> keptMode = std::nullopt);
     // Replaces the targets; one result per add(), in the order of the calls,
     // a refused add() keeping its reason. The batch is empty afterwards.
     std::vector<std::optional<QString>> commit();
@@ -59,6 +64,14 @@ private:
     std::vector<Pending> m_files;
     int m_open = 0;
 };
+
+// Where a save keeps the version of a file it replaces.
+QString backupPath(const QString &path);
+
+// Copies the file at path to backupPath(path) as AtomicBatch::addBackup
+// does, written at once; nothing on success, otherwise why not.
+std::optional<QString> writeBackup(const QString &path, const QString &trustedTop = QStringLiteral("/"),
+                                   std::optional<mode_t> keptMode = std::nullopt);
 
 // Why a name may not become a file name in a directory of ours or a line of
 // a list, or nothing when it may: an empty name, "/", a leading ".", a

@@ -17,6 +17,8 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <utility>
+#include <vector>
 
 #include <sys/stat.h>
 
@@ -31,7 +33,9 @@ class FtpServerConfig
 public:
     // ReadOnly creates and changes nothing under the root: a missing main
     // configuration reads as "listen=YES", no directory, environment or
-    // database file is made.
+    // database file is made, and a repair that would change a directory at
+    // once (create it, its owner, its mode) counts as made without touching
+    // it, so that an edit can be planned (planSave()) as it would be saved.
     enum class Mode { ReadWrite, ReadOnly };
     enum class UserlistMode { Off = 0, Allow = 1, Deny = 2 };
 
@@ -125,13 +129,17 @@ public:
     // missing) or, for the anonymous user, into the main configuration.
     bool setUserRights(const QByteArray &user, const QString &rights);
     // Creates the user's per-user file on disk with its first comment line
-    // and registers it. Refuses names that cannot be file names.
+    // and registers it (read-only: in memory only, for the next save to
+    // write). Refuses names that cannot be file names.
     bool createUserConfig(const QByteArray &user);
     // anon_root for the anonymous user, local_root in the per-user file for
     // everybody else.
     bool setUserRoot(const QByteArray &user, const QByteArray &directory);
     // Confines a local user to its root through the chroot keys and list.
     void setChrooted(const QByteArray &user);
+    // Asks whether a user who is not confined should be, now that the
+    // directory becomes the user's root; confines on Yes.
+    void offerChroot(const QByteArray &user, const QByteArray &directory);
     // Compares the rights with the permission bits of the user's root and
     // offers to fix the bits; changes the directory at once.
     void checkFolderPermissions(const QByteArray &user, const QStringList &rights);
@@ -140,8 +148,32 @@ public:
 
     // Writes back everything loaded and changed, store by store; a failure
     // is reported and the next store is written all the same. True when
-    // nothing failed. Files whose content did not change are not touched.
+    // nothing failed. Files whose content did not change are not touched;
+    // each file replaced is kept first as FILE.ftpconfig-bak (the virtual
+    // users database too), with the mode and owner it had.
     bool save();
+
+    // One file a save would write.
+    struct PlannedFile
+    {
+        QString path; // as the administrator knows it
+        QByteArray current; // on disk now; empty when the file does not exist yet
+        QByteArray next; // what the save writes
+        bool exists = false;
+    };
+    // What save() would write now, in its order, computed by the same steps
+    // and writing nothing. The virtual users database shows only names.
+    struct SavePlan
+    {
+        std::vector<PlannedFile> files;
+        QByteArray virtualUsersPath; // as the administrator knows it
+        QList<QByteArray> addedVirtualUsers;
+        // A new password or a new name; second is the name on disk before a
+        // rename, empty for a password change.
+        QList<std::pair<QByteArray, QByteArray>> changedVirtualUsers;
+        QList<QByteArray> removedVirtualUsers;
+    };
+    SavePlan planSave() const;
 
     // The list files as the main configuration names them now, or the
     // program's defaults.
@@ -233,8 +265,12 @@ private:
     void remember(const QString &key, const ConfigFile &document);
     bool unchanged(const QString &key, const std::string &text) const;
     QByteArray nameListContent(const NameList &names, const QByteArray &path) const;
-    bool saveNameList(const QByteArray &path, const NameList &names);
-    bool saveUserConfigs();
+    // The files a save writes and the problems it reports, from main (the
+    // main configuration itself for a save, a copy for a plan), which gets
+    // the keys a save always sets.
+    struct SaveWork;
+    SaveWork prepareSave(ConfigFile &main) const;
+    bool writeUserConfigs(const SaveWork &work, std::size_t first, std::size_t end);
     // Through the atomic writer, trusting links only root could have made
     // under the root directory.
     std::optional<QString> writeFile(const QString &file, const QByteArray &content);
@@ -286,6 +322,9 @@ private:
     // How each document printed when it was loaded: a save leaves a file
     // that would print the same untouched, byte for byte.
     std::map<QString, std::string> m_loadedText;
+    // Per-user files this run created on disk (with their comment line
+    // only): a save keeps no backup of them, nobody's version is lost.
+    QSet<QString> m_createdFiles;
 };
 
 // The translated rights words of a list, in the fixed display order.

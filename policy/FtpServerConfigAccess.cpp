@@ -141,7 +141,8 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
         }
         AccountRecord chosen;
         if (!m_accounts->getUserInfo(owner->toUtf8(), chosen)
-            || ::chown(QFile::encodeName(onDisk).constData(), chosen.uid, static_cast<gid_t>(-1)) != 0) {
+            || (m_mode == Mode::ReadWrite
+                && ::chown(QFile::encodeName(onDisk).constData(), chosen.uid, static_cast<gid_t>(-1)) != 0)) {
             m_interaction.show({Interaction::Icon::Critical, QString(), tr("Unable to change root directory owner."),
                                 tr("Unable to change ftp root owner"), QString()});
             return refuse(failure, FailureKind::Filesystem,
@@ -167,7 +168,8 @@ bool FtpServerConfig::checkRootDirectory(const QByteArray &user, bool repair, Ac
             question.defaultButton = Interaction::Button::Yes;
             if (m_interaction.ask(question) == Interaction::Button::Yes) {
                 const QString absolute = QFileInfo(onDisk).absoluteFilePath();
-                fixed = ::chmod(QFile::encodeName(absolute).constData(), info->st_mode & 07777 & ~S_IWGRP) == 0;
+                fixed = m_mode == Mode::ReadOnly
+                    || ::chmod(QFile::encodeName(absolute).constData(), info->st_mode & 07777 & ~S_IWGRP) == 0;
             }
         }
         if (!fixed) {

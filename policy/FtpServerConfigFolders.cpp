@@ -16,6 +16,10 @@ bool FtpServerConfig::createRootDirectory(const QByteArray &user, const QByteArr
 {
     const QString shown = text(directory);
     const QString onDisk = resolved(directory);
+    // Read-only (a dry run of an edit) changes nothing on disk: the repair
+    // counts as made, as it would be.
+    if (m_mode == Mode::ReadOnly && !directory.isEmpty())
+        return true;
     if (directory.isEmpty() || !QDir().mkpath(onDisk)) {
         return refuse(failure, FailureKind::Filesystem, refusal("Unable to create directory %1.").arg(shown));
     }
@@ -128,6 +132,21 @@ void FtpServerConfig::checkFolderPermissions(const QByteArray &user, const QStri
         else if (!isYes("guest_enable"))
             askFix(tr("User may write, but folder has no WRITE permission for user %1"), writeBit);
     }
-    if (mode != (info.st_mode & 07777) && ::chmod(onDisk.constData(), mode) != 0)
+    if (mode != (info.st_mode & 07777) && m_mode == Mode::ReadWrite && ::chmod(onDisk.constData(), mode) != 0)
         m_interaction.critical(QString(), tr("Unable to change permissions of folder %1").arg(shown));
+}
+
+void FtpServerConfig::offerChroot(const QByteArray &user, const QByteArray &directory)
+{
+    if (isChrooted(user))
+        return;
+    Interaction::Question question;
+    question.message = {Interaction::Icon::Question, QString(),
+                        tr("This user is not chroot'ed to his home folder.\nDo you want to restrict access "
+                           "outside given folder: %1")
+                            .arg(QString::fromLocal8Bit(directory)),
+                        QString(), QString()};
+    question.buttons = {Interaction::Button::Yes, Interaction::Button::No};
+    if (m_interaction.ask(question) == Interaction::Button::Yes)
+        setChrooted(user);
 }

@@ -103,6 +103,14 @@ bool FtpServerConfig::createUserConfig(const QByteArray &user)
         std::cout << "File " << path.constData() << " is not created." << std::endl;
         return false;
     }
+    auto document = std::make_shared<ConfigFile>(SyntaxMode::KeyValue);
+    document->parseText(CreatedComment);
+    if (m_mode == Mode::ReadOnly) {
+        // Held in memory only, so that a plan of the save shows it as the
+        // new file it would be.
+        m_userConfigs[user] = document;
+        return true;
+    }
     const QString file = resolved(path);
     QDir().mkpath(QFileInfo(file).absolutePath());
     if (writeFile(file, CreatedComment)) {
@@ -111,9 +119,8 @@ bool FtpServerConfig::createUserConfig(const QByteArray &user)
         std::cout << "File " << path.constData() << " is not created." << std::endl;
         return false;
     }
-    auto document = std::make_shared<ConfigFile>(SyntaxMode::KeyValue);
-    document->parseText(CreatedComment);
     m_userConfigs[user] = document;
+    m_createdFiles.insert(text(path));
     // On disk already: a save writes it again only once it is changed.
     remember(text(path), *document);
     return true;

@@ -11,6 +11,8 @@
 #include <QFileInfo>
 
 #include <iostream>
+#include <map>
+#include <stdexcept>
 #include <utility>
 #include <vector>
 
@@ -70,84 +72,243 @@ QByteArray FtpServerConfig::nameListContent(const NameList &names, const QByteAr
     return content;
 }
 
-bool FtpServerConfig::saveNameList(const QByteArray &path, const NameList &names)
+// What a save does, step by step: files in the order they are written,
+// with the problems and directories met on the way in their place. The
+// database of virtual users is written before them all and is no step.
+struct FtpServerConfig::SaveWork
 {
-    const QString shown = text(path);
-    const QString file = resolved(path);
-    const QByteArray content = nameListContent(names, path);
-    // A list whose names did not change stays as the administrator wrote
-    // it; a missing one is created, since an enabled list without its file
-    // stops the server.
-    if (QFileInfo(file).isFile() && unchanged(shown, content.toStdString()))
-        return true;
-    const QString directory = directoryOf(file);
-    if (!QDir().mkpath(directory)) {
-        m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(directoryOf(shown)));
-    }
-    if (const auto error = writeFile(file, content)) {
-        reportUnsaved(shown, *error);
-        return false;
-    }
-    m_loadedText[shown] = content.toStdString();
-    return true;
-}
+    enum class Kind {
+        List, // a name list: its directory made first
+        UserConfigDir, // made before the per-user files, even when none changed
+        UserConfig, // the per-user files, written together
+        File, // the PAM file, the pam_listfile list, the main configuration
+        Problem, // a critical message
+        Log, // a line on standard output
+    };
+    struct Step
+    {
+        Kind kind;
+        QString shown; // the path as the administrator knows it, or the message's title
+        QString file; // resolved under the root
+        QByteArray content;
+        std::string remembered; // what the document prints once written
+        QString message; // of a problem or a log line; for a file, logged when it fails
+        bool fails = false;
+    };
+    std::vector<Step> steps;
+    QByteArray userlistPath;
+    QByteArray chrootListPath;
 
-bool FtpServerConfig::saveUserConfigs()
-{
-    bool ok = true;
-    const QString directory = resolved(m_userConfigDir);
-    if (!QDir().mkpath(directory)) {
-        m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(text(m_userConfigDir)));
-        std::cerr << "Unable to create userconf dir: " << m_userConfigDir.constData() << std::endl;
-        ok = false;
+    bool writes(const Step &step) const
+    {
+        return step.kind == Kind::List || step.kind == Kind::UserConfig || step.kind == Kind::File;
     }
-    // Written together: synced as one batch and their directory once,
-    // rather than two waits for the disk for each file, with every file
-    // still old or new after a crash.
-    AtomicBatch batch;
-    std::vector<std::pair<QString, std::string>> written; // shown path, printed text
-    for (const auto &[user, document] : m_userConfigs) {
+};
+
+FtpServerConfig::SaveWork FtpServerConfig::prepareSave(ConfigFile &main) const
+{
+    using Kind = SaveWork::Kind;
+    SaveWork work;
+    const auto nameList = [&](const QByteArray &path, const NameList &names) {
+        const QString file = resolved(path);
+        const QByteArray content = nameListContent(names, path);
+        // A list whose names did not change stays as the administrator wrote
+        // it; a missing one is created, since an enabled list without its
+        // file stops the server.
+        if (QFileInfo(file).isFile() && unchanged(text(path), content.toStdString()))
+            return;
+        work.steps.push_back({Kind::List, text(path), file, content, content.toStdString(), {}, false});
+    };
+    const auto document
+        = [&](const QString &shown, const QString &file, const ConfigFile &changed, const QString &log) {
+              std::string printed = changed.text();
+              if (unchanged(shown, printed))
+                  return;
+              const QByteArray content = QByteArray::fromStdString(printed);
+              work.steps.push_back({Kind::File, shown, file, content, std::move(printed), log, false});
+          };
+
+    // Userlist, always enabled afterwards.
+    work.userlistPath = configuredUserlistPath();
+    nameList(work.userlistPath, m_userlist);
+    setValue(main.elements, "", "userlist_enable", "yes");
+    // The server's own default is another file (/etc/vsftpd.user_list): an
+    // enabled list it cannot read would stop every login, so the server is
+    // told which file the program keeps.
+    if (!findData(main.elements, "", "userlist_file"))
+        appendData(main.elements, "userlist_file", work.userlistPath.toStdString());
+
+    // Chroot list.
+    work.chrootListPath = configuredChrootListPath();
+    nameList(work.chrootListPath, m_chrootList);
+
+    // Per-user files.
+    work.steps.push_back({Kind::UserConfigDir, text(m_userConfigDir), resolved(m_userConfigDir), {}, {}, {}, true});
+    std::vector<SaveWork::Step> userFiles;
+    for (const auto &[user, userDocument] : m_userConfigs) {
         const QString shown = text(m_userConfigDir + user);
-        std::string printed = document->text();
+        std::string printed = userDocument->text();
         if (unchanged(shown, printed))
             continue;
+        if (const auto reason = invalidNameReason(user)) {
+            work.steps.push_back({Kind::Problem,
+                                  QString(),
+                                  {},
+                                  {},
+                                  {},
+                                  tr("Unable to save %1").arg(shown) + QLatin1Char('\n')
+                                      + tr("\"%1\" cannot be a file name: %2.").arg(text(user), *reason),
+                                  false});
+            continue;
+        }
         // The program has always ended these files with an empty line; one
         // that has it already (read back from an earlier save) gets no
         // second, or every save would grow the file by a line.
         const bool endsEmpty = printed.size() >= 2 && printed.compare(printed.size() - 2, 2, "\n\n") == 0;
         const QByteArray content = QByteArray::fromStdString(printed) + (endsEmpty ? "" : "\n");
-        if (const auto reason = invalidNameReason(user)) {
-            m_interaction.critical(QString(),
-                                   tr("Unable to save %1").arg(shown) + QLatin1Char('\n')
-                                       + tr("\"%1\" cannot be a file name: %2.").arg(text(user), *reason));
+        userFiles.push_back(
+            {Kind::UserConfig, shown, resolved(m_userConfigDir + user), content, std::move(printed), {}, false});
+    }
+    work.steps.insert(work.steps.end(), std::make_move_iterator(userFiles.begin()),
+                      std::make_move_iterator(userFiles.end()));
+
+    // PAM file.
+    const QString pamPath = AppStrings::instance().pamDirectory + text(value("pam_service_name", "vsftpd"));
+    const QString pamFile = resolved(QFile::encodeName(pamPath));
+    if (!QFileInfo(pamFile).isFile()) {
+        work.steps.push_back({Kind::Problem,
+                              tr("Save PAM file"),
+                              {},
+                              {},
+                              {},
+                              tr("Unable to find vsftpd PAM config file (default is in /etc/pam.d/vsftpd).\nIt is "
+                                 "neccesary for virtual users mechanism. Create it and re-run ftp config"),
+                              true});
+    } else {
+        document(pamPath, pamFile, m_pam, QStringLiteral("File %1 could not be created or opened").arg(pamPath));
+    }
+
+    // The pam_listfile list. A missing one is not created: its absence is
+    // what the rule's onerr= decides on.
+    if (m_ftpusersRule) {
+        const QString listPath = text(m_ftpusersRule->file);
+        const QString listFile = resolved(m_ftpusersRule->file);
+        if (!QFileInfo(listFile).isFile())
+            work.steps.push_back(
+                {Kind::Log, listPath, {}, {}, {}, QStringLiteral("File %1 not found").arg(listPath), false});
+        else
+            document(listPath, listFile, m_ftpusers,
+                     QStringLiteral("Ftpusers file (%1) could not be open").arg(listPath));
+    }
+
+    // Main configuration.
+    const QString mainPath = AppStrings::instance().mainConfigPath;
+    document(mainPath, m_root.resolve(mainPath), main, QString());
+    return work;
+}
+
+FtpServerConfig::SavePlan FtpServerConfig::planSave() const
+{
+    // A copy by print and parse: the documents share their elements, and a
+    // plan must leave the configuration as it found it.
+    ConfigFile main = m_main;
+    main.parseText(m_main.text());
+    const SaveWork work = prepareSave(main);
+    SavePlan plan;
+    for (const SaveWork::Step &step : work.steps) {
+        if (!work.writes(step))
             continue;
+        PlannedFile file{step.shown, {}, step.content, false};
+        QFile onDisk(step.file);
+        if (QFileInfo(step.file).isFile() && onDisk.open(QIODevice::ReadOnly)) {
+            file.current = onDisk.readAll();
+            file.exists = true;
         }
+        plan.files.push_back(std::move(file));
+    }
+    if (m_accounts && m_accounts->virtualUsersChanged()) {
+        plan.virtualUsersPath = m_dbPath;
+        for (const auto &[name, record] : m_accounts->virtualUsers()) {
+            switch (record.state) {
+            case VirtualUserState::Added:
+                plan.addedVirtualUsers.append(name);
+                break;
+            case VirtualUserState::Modified:
+                plan.changedVirtualUsers.append({name, record.previousName});
+                break;
+            case VirtualUserState::Deleted:
+                plan.removedVirtualUsers.append(name);
+                break;
+            case VirtualUserState::Unchanged:
+                break;
+            }
+        }
+    }
+    return plan;
+}
+
+bool FtpServerConfig::writeUserConfigs(const SaveWork &work, std::size_t first, std::size_t end)
+{
+    // Written together: synced as one batch and their directory once,
+    // rather than two waits for the disk for each file, with every file
+    // still old or new after a crash. The versions they replace are kept
+    // first, in a batch of their own; a file whose version could not be
+    // kept is left as it is.
+    AtomicBatch backups;
+    std::vector<std::size_t> backedUp;
+    for (std::size_t i = first; i < end; ++i) {
+        if (QFileInfo(work.steps[i].file).isFile() && !m_createdFiles.contains(work.steps[i].shown)) {
+            backups.addBackup(work.steps[i].file, trustedTop(m_root));
+            backedUp.push_back(i);
+        }
+    }
+    std::map<std::size_t, QString> refused;
+    const auto kept = backups.commit();
+    for (std::size_t k = 0; k < backedUp.size(); ++k) {
+        if (kept[k])
+            refused[backedUp[k]] = tr("the previous version could not be kept: %1").arg(*kept[k]);
+    }
+    AtomicBatch batch;
+    std::vector<std::size_t> written;
+    for (std::size_t i = first; i < end; ++i) {
+        if (refused.count(i))
+            continue;
         // A refused file comes back from commit() in its place.
-        batch.add(resolved(m_userConfigDir + user), content, 0644, trustedTop(m_root));
-        written.emplace_back(shown, std::move(printed));
+        batch.add(work.steps[i].file, work.steps[i].content, 0644, trustedTop(m_root));
+        written.push_back(i);
     }
     const auto results = batch.commit();
-    for (std::size_t i = 0; i < written.size(); ++i) {
-        if (results[i]) {
-            reportUnsaved(written[i].first, *results[i]);
-            ok = false;
-        } else {
-            m_loadedText[written[i].first] = std::move(written[i].second);
-        }
+    for (std::size_t k = 0; k < written.size(); ++k) {
+        if (results[k])
+            refused[written[k]] = *results[k];
+        else
+            m_loadedText[work.steps[written[k]].shown] = work.steps[written[k]].remembered;
     }
-    return ok;
+    for (const auto &[index, reason] : refused)
+        reportUnsaved(work.steps[index].shown, reason);
+    return refused.empty();
 }
 
 bool FtpServerConfig::save()
 {
+    using Kind = SaveWork::Kind;
     if (m_mode == Mode::ReadOnly)
         return false;
     bool ok = true;
 
-    // 1. Virtual users.
+    // 1. Virtual users. The file is copied before the transaction rather
+    // than kept by the environment's logs: pam_userdb and db_load read a
+    // plain hash file, which is what an administrator can put back.
     try {
-        if (m_accounts)
+        if (m_accounts) {
+            const QString database = resolved(m_dbPath);
+            if (m_accounts->virtualUsersChanged() && QFileInfo(database).isFile()) {
+                if (const auto error = writeBackup(database, trustedTop(m_root), 0600))
+                    throw std::runtime_error(
+                        tr("the previous version could not be kept: %1").arg(*error).toLocal8Bit().toStdString());
+            }
             m_accounts->saveVirtualUsers();
+        }
     } catch (const std::exception &e) {
         m_interaction.critical(QString(),
                                tr("Unable to save virtual users. Message: ") + QString::fromLocal8Bit(e.what()));
@@ -157,73 +318,66 @@ bool FtpServerConfig::save()
         ok = false;
     }
 
-    // 2. Userlist, always enabled afterwards.
-    m_userlistPath = configuredUserlistPath();
-    ok = saveNameList(m_userlistPath, m_userlist) && ok;
-    setValue(m_main.elements, "", "userlist_enable", "yes");
-    // The server's own default is another file (/etc/vsftpd.user_list): an
-    // enabled list it cannot read would stop every login, so the server is
-    // told which file the program keeps.
-    if (!findData(m_main.elements, "", "userlist_file"))
-        appendData(m_main.elements, "userlist_file", m_userlistPath.toStdString());
+    // 2. to 7. The userlist (always enabled afterwards), the chroot list,
+    // the per-user files, the PAM file, the pam_listfile list and the main
+    // configuration.
+    const SaveWork work = prepareSave(m_main);
+    m_userlistPath = work.userlistPath;
     m_userlistModified = false;
-
-    // 3. Chroot list.
-    m_chrootListPath = configuredChrootListPath();
-    ok = saveNameList(m_chrootListPath, m_chrootList) && ok;
+    m_chrootListPath = work.chrootListPath;
     m_chrootListModified = false;
-
-    // 4. Per-user files.
-    ok = saveUserConfigs() && ok;
-
-    // 5. PAM file.
-    const QString pamPath = AppStrings::instance().pamDirectory + text(value("pam_service_name", "vsftpd"));
-    if (!QFileInfo(resolved(QFile::encodeName(pamPath))).isFile()) {
-        m_interaction.critical(tr("Save PAM file"),
-                               tr("Unable to find vsftpd PAM config file (default is in /etc/pam.d/vsftpd).\nIt is "
-                                  "neccesary for virtual users mechanism. Create it and re-run ftp config"));
-        ok = false;
-    } else if (!unchanged(pamPath, m_pam.text())) {
-        if (const auto error
-            = writeFile(resolved(QFile::encodeName(pamPath)), QByteArray::fromStdString(m_pam.text()))) {
-            std::cout << "File " << QFile::encodeName(pamPath).constData() << " could not be created or opened"
-                      << std::endl;
-            reportUnsaved(pamPath, *error);
-            ok = false;
-        } else {
-            remember(pamPath, m_pam);
-        }
-    }
-
-    // 6. The pam_listfile list. A missing one is not created: its absence
-    // is what the rule's onerr= decides on.
-    if (m_ftpusersRule) {
-        const QString listPath = text(m_ftpusersRule->file);
-        if (!QFileInfo(resolved(m_ftpusersRule->file)).isFile()) {
-            std::cout << "File " << m_ftpusersRule->file.constData() << " not found" << std::endl;
-        } else if (!unchanged(listPath, m_ftpusers.text())) {
-            if (const auto error
-                = writeFile(resolved(m_ftpusersRule->file), QByteArray::fromStdString(m_ftpusers.text()))) {
-                std::cout << "Ftpusers file (" << m_ftpusersRule->file.constData() << ") could not be open"
+    if (m_ftpusersRule)
+        m_ftpusersModified = false;
+    for (std::size_t i = 0; i < work.steps.size();) {
+        const SaveWork::Step &step = work.steps[i];
+        switch (step.kind) {
+        case Kind::Problem:
+            m_interaction.critical(step.shown, step.message);
+            ok = ok && !step.fails;
+            break;
+        case Kind::Log:
+            std::cout << step.message.toLocal8Bit().constData() << std::endl;
+            break;
+        case Kind::UserConfigDir:
+            if (!QDir().mkpath(step.file)) {
+                m_interaction.warn(QString(), tr("Unable to create path %1. Server may not start.").arg(step.shown));
+                std::cerr << "Unable to create userconf dir: " << QFile::encodeName(step.shown).constData()
                           << std::endl;
-                reportUnsaved(listPath, *error);
+                ok = false;
+            }
+            break;
+        case Kind::UserConfig: {
+            std::size_t end = i;
+            while (end < work.steps.size() && work.steps[end].kind == Kind::UserConfig)
+                ++end;
+            ok = writeUserConfigs(work, i, end) && ok;
+            i = end;
+            continue;
+        }
+        case Kind::List:
+        case Kind::File: {
+            if (step.kind == Kind::List && !QDir().mkpath(directoryOf(step.file)))
+                m_interaction.warn(QString(),
+                                   tr("Unable to create path %1. Server may not start.").arg(directoryOf(step.shown)));
+            std::optional<QString> error;
+            if (QFileInfo(step.file).isFile()) {
+                if (const auto notKept = writeBackup(step.file, trustedTop(m_root)))
+                    error = tr("the previous version could not be kept: %1").arg(*notKept);
+            }
+            if (!error)
+                error = writeFile(step.file, step.content);
+            if (error) {
+                if (!step.message.isEmpty())
+                    std::cout << step.message.toLocal8Bit().constData() << std::endl;
+                reportUnsaved(step.shown, *error);
                 ok = false;
             } else {
-                remember(listPath, m_ftpusers);
+                m_loadedText[step.shown] = step.remembered;
             }
+            break;
         }
-        m_ftpusersModified = false;
-    }
-
-    // 7. Main configuration.
-    const QString mainPath = AppStrings::instance().mainConfigPath;
-    if (!unchanged(mainPath, m_main.text())) {
-        if (const auto error = writeFile(m_root.resolve(mainPath), QByteArray::fromStdString(m_main.text()))) {
-            reportUnsaved(mainPath, *error);
-            ok = false;
-        } else {
-            remember(mainPath, m_main);
         }
+        ++i;
     }
     if (ok)
         m_modified = false;

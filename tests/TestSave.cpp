@@ -28,11 +28,13 @@ FileMap richFiles()
     };
 }
 
+// The files a save changed, without the backups it kept of them.
 QStringList differences(const FileMap &before, const FileMap &after)
 {
     QStringList changed;
     for (const QString &path : before.keys() + after.keys()) {
-        if (!changed.contains(path) && before.value(path, "<absent>") != after.value(path, "<absent>"))
+        if (!changed.contains(path) && !path.endsWith(QLatin1String(".ftpconfig-bak"))
+            && before.value(path, "<absent>") != after.value(path, "<absent>"))
             changed << path;
     }
     changed.sort();
@@ -115,14 +117,34 @@ void TestSave::changeSaveReload()
     config.blockUserByUserlist("bob");
     config.setChrooted("alice");
     config.accounts().addVirtualUser("vera", "pw");
+    config.accounts().changeVirtualUser("vic", "victor", {});
+    const FtpServerConfig::SavePlan plan = config.planSave();
     QVERIFY(config.save());
     QCOMPARE(engine.interaction.records.size(), 0);
 
-    QCOMPARE(
-        differences(before, engine.root.files()),
-        QStringLiteral("/etc/ftpusers /etc/vsftpd.chroot_list /etc/vsftpd.conf /etc/vsftpd.d/allowed_user_list.conf "
-                       "/etc/vsftpd.d/users.d/alice /etc/vsftpd/virtual.db")
-            .split(QLatin1Char(' ')));
+    // The plan is what the save then wrote, byte for byte, and each file
+    // replaced is kept as it was; the database shows names only.
+    const FileMap written = engine.root.files();
+    QStringList planned{QStringLiteral("/etc/vsftpd/virtual.db")};
+    for (const FtpServerConfig::PlannedFile &file : plan.files) {
+        planned << file.path;
+        QCOMPARE(written.value(file.path), file.next);
+        QCOMPARE(file.current, before.value(file.path));
+        QCOMPARE(file.exists, before.contains(file.path));
+        QCOMPARE(written.value(file.path + QLatin1String(".ftpconfig-bak"), "<none>"),
+                 file.exists ? file.current : QByteArray("<none>"));
+    }
+    planned.sort();
+    QCOMPARE(planned,
+             QStringLiteral("/etc/ftpusers /etc/vsftpd.chroot_list /etc/vsftpd.conf "
+                            "/etc/vsftpd.d/allowed_user_list.conf /etc/vsftpd.d/users.d/alice /etc/vsftpd/virtual.db")
+                 .split(QLatin1Char(' ')));
+    QCOMPARE(differences(before, written), planned);
+    QCOMPARE(plan.virtualUsersPath, QByteArray("/etc/vsftpd/virtual.db"));
+    QCOMPARE(plan.addedVirtualUsers, QList<QByteArray>{"vera"});
+    QCOMPARE(plan.changedVirtualUsers, (QList<std::pair<QByteArray, QByteArray>>{{"victor", "vic"}}));
+    QCOMPARE(written.value(QStringLiteral("/etc/vsftpd/virtual.db.ftpconfig-bak")),
+             before.value(QStringLiteral("/etc/vsftpd/virtual.db")));
     QCOMPARE(engine.root.readFile(QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf")),
              QByteArray("carl\nalice\nbob\n"));
     QCOMPARE(engine.root.readFile(QStringLiteral("/etc/vsftpd.chroot_list")), QByteArray("bob\nalice\n"));

@@ -16,13 +16,18 @@ namespace {
 const QString Child = QStringLiteral(FTPCONFIG_SAVECHILD);
 
 // The files below the root; those an interrupted save left beside their
-// targets are counted apart. The database is written record by record in
-// transactions of its own and is not compared.
-FileMap snapshot(const QString &root, QStringList *leftovers = nullptr)
+// targets are counted apart, and so are the backups of the files it
+// replaced (a save killed early has made fewer). The database is written
+// record by record in transactions of its own and is not compared.
+FileMap snapshot(const QString &root, QStringList *leftovers = nullptr, FileMap *backups = nullptr)
 {
     FileMap files = regularFiles(root);
     for (const QString &path : files.keys()) {
-        if (leftovers && path.contains(QLatin1String(".ftpconfig-"))) {
+        if (path.endsWith(QLatin1String(".ftpconfig-bak"))) {
+            if (backups)
+                backups->insert(path.chopped(14), files.value(path));
+            files.remove(path);
+        } else if (leftovers && path.contains(QLatin1String(".ftpconfig-"))) {
             leftovers->append(path);
             files.remove(path);
         }
@@ -126,9 +131,13 @@ void TestSaveCrash::killedMidSave()
         QVERIFY(child.waitForFinished(10000));
 
         QStringList leftovers;
-        const auto state = snapshot(work, &leftovers);
+        FileMap backups;
+        const auto state = snapshot(work, &leftovers, &backups);
         leftoverFiles += leftovers.size();
         QCOMPARE(state.keys(), after.keys());
+        // A backup is whole, or not there yet.
+        for (auto it = backups.begin(); it != backups.end(); ++it)
+            QVERIFY2(*it == before.value(it.key()), qPrintable(QStringLiteral("torn backup of ") + it.key()));
         int fresh = 0;
         for (auto it = state.begin(); it != state.end(); ++it) {
             const bool old = before.contains(it.key()) && it.value() == before.value(it.key());

@@ -524,17 +524,7 @@ bool TreeModel::setDirectory(Item &item, const QString &directory)
     }
     const QByteArray path = directory.toLocal8Bit();
     m_config->checkFolderPermissions(item.name, m_config->userRights(item.name), path);
-    if (!m_config->isChrooted(item.name)) {
-        Interaction::Question question;
-        question.message = {Interaction::Icon::Question, QString(),
-                            tr("This user is not chroot'ed to his home folder.\nDo you want to restrict access "
-                               "outside given folder: %1")
-                                .arg(directory),
-                            QString(), QString()};
-        question.buttons = {Interaction::Button::Yes, Interaction::Button::No};
-        if (m_interaction.ask(question) == Interaction::Button::Yes)
-            m_config->setChrooted(item.name);
-    }
+    m_config->offerChroot(item.name, path);
     if (!m_config->setUserRoot(item.name, path))
         return false;
     return true;

@@ -56,15 +56,18 @@ NO_LOGIN = "no-login"
 UPLOAD_NAME = "e2e-upload.txt"
 UPLOAD_DATA = b"uploaded through the saved rights\n"
 
-EDITS = ("grant", "deny", "rights", "directory", "vadd", "vchange", "vdelete", "options")
+EDITS = ("grant", "deny", "rights", "directory", "vadd", "vchange", "vdelete", "options", "set")
 # What windowedit does through the window; who makes a scenario's edit.
 WINDOW_EDITS = ("grant", "deny", "vadd", "vchange", "vdelete", "options")
 ENGINE_EDITS = ("grant", "deny", "rights", "directory", "vadd", "vchange", "vdelete")
-THROUGH = ("engine", "window")
+# ftpconfig-ctl (--ctl), with --yes, and the command each edit becomes.
+CTL_COMMANDS = {"grant": ["allow"], "deny": ["deny"], "vadd": ["vuser", "add"], "set": ["set"]}
+THROUGH = ("engine", "window", "ctl")
+BACKUP = ".ftpconfig-bak"
 CHANGES = {harness.CONTENT, harness.MODE, harness.CREATED, harness.REMOVED}
 
 
-def run_edit(program: str, edit: List[str], run_dir: str) -> Tuple[bool, str]:
+def run_edit(program: str, edit: List[str], run_dir: str, refused: str = "") -> Tuple[bool, str]:
     """editchild or windowedit on the system root. The engine opens its
     Berkeley DB environment in /var/lib/ftpconfig (creating it) on every
     load: a mount namespace of the child's own puts an empty directory over
@@ -76,12 +79,22 @@ def run_edit(program: str, edit: List[str], run_dir: str) -> Tuple[bool, str]:
     os.makedirs(home, 0o700, exist_ok=True)
     env = dict(os.environ, HOME=home, XDG_CONFIG_HOME=os.path.join(home, ".config"))
     mount = 'mount --bind "$0" /var/lib && exec "$@"'
+    # ftpconfig-ctl takes the password of a new virtual user on its
+    # standard input only.
+    stdin = ""
+    if program == CTL:
+        stdin = edit[2] + "\n" if edit[0] == "vadd" else ""
+        edit = ["--yes", *CTL_COMMANDS[edit[0]], *edit[1 : 2 if edit[0] == "vadd" else None]]
     command = ["unshare", "-m", "--propagation", "private", "sh", "-c", mount, var_lib, program, "--root", "/", *edit]
     try:
-        done = subprocess.run(command, capture_output=True, text=True, timeout=EDIT_TIMEOUT, env=env)
+        done = subprocess.run(command, input=stdin, capture_output=True, text=True, timeout=EDIT_TIMEOUT, env=env)
     except (OSError, subprocess.TimeoutExpired) as error:
         return False, f"{os.path.basename(program)}: {error}"
     output = (done.stdout.strip() + "\n" + done.stderr.strip()).strip()
+    if refused:
+        return done.returncode == 1 and refused in done.stderr, f"exit {done.returncode}: {output}"
+    if program == CTL:
+        return done.returncode == 0, f"exit {done.returncode}: {output}"
     return done.returncode == 0 and done.stdout.strip() == "done saved", f"exit {done.returncode}: {output}"
 
 
@@ -244,6 +257,21 @@ def check_forecast(scenario: Scenario, report: str, run_dir: str, logins: Dict[s
 def check_saved(scenario: Scenario, tmp: str, port: int, before, after, checks: Checks) -> None:
     declared = {harness.fill(path, tmp): what for path, what in scenario.changes.items()}
     found = harness.differences(before, after)
+    # Every save keeps the version of each file it replaces, with its mode
+    # and owner (the virtual users database mode 0600), and nothing else.
+    for path in [p for p in found if p.endswith(BACKUP)]:
+        original, kept = path[: -len(BACKUP)], after.get(path)
+        old = before.get(original)
+        checks.check(
+            f"backup:{original}",
+            harness.CONTENT in found.get(original, "")
+            and old is not None
+            and kept is not None
+            and (kept.payload, kept.uid, kept.gid) == (old.payload, old.uid, old.gid)
+            and kept.mode == (0o600 if original.endswith(".db") else old.mode),
+            f"{path}: {found[path]}, the original {found.get(original) or 'untouched'}",
+        )
+        del found[path]
     for path in sorted(declared.keys() | found.keys()):
         checks.check(
             f"files:{path}",
@@ -262,11 +290,12 @@ def check_saved(scenario: Scenario, tmp: str, port: int, before, after, checks: 
 
 
 def run_scenario(scenario: Scenario, program: str, base: str) -> bool:
-    if scenario.through == "window":
-        if not WINDOW:
-            print(f"{scenario.name:28} ERROR its edit goes through the window, and no --window program was given")
+    if scenario.through in ("window", "ctl"):
+        given = WINDOW if scenario.through == "window" else CTL
+        if not given:
+            print(f"{scenario.name:28} ERROR its edit goes through {scenario.through}, and no --{scenario.through} program")
             return False
-        program = WINDOW
+        program = given
     tmp = os.path.join(base, "root")  # what the scenario sets up: compared
     run_dir = os.path.join(base, "run")  # the harness's own: not compared
     os.makedirs(tmp, 0o755)
@@ -289,7 +318,7 @@ def run_scenario(scenario: Scenario, program: str, base: str) -> bool:
         tracked = ["/etc", tmp]
         top_modes = {path: os.lstat(path).st_mode for path in ("/", "/tmp", base)}
         before = harness.capture(tracked)
-        done, edit_output = run_edit(program, edit, run_dir)
+        done, edit_output = run_edit(program, edit, run_dir, scenario.refused)
         after = harness.capture(tracked)
         for path, mode in top_modes.items():
             if os.lstat(path).st_mode != mode:
@@ -331,7 +360,7 @@ def run_scenario(scenario: Scenario, program: str, base: str) -> bool:
         outcome = "ok" if ok else "FAIL: " + describe(checks.failed, tmp)
     # The options edit names a widget a setting: too many to show.
     what = f"options ({len(edit) - 1} settings)" if edit[0] == "options" else " ".join(edit).replace(tmp, "{tmp}")
-    shown = ("window: " if scenario.through == "window" else "") + what
+    shown = ("" if scenario.through == "engine" else scenario.through + ": ") + what
     print(f"{scenario.name:28} {shown:40} {checks.count:3} checks  {outcome}")
     if not ok and edit_output:
         print(f"{'':28} {os.path.basename(program)}: {edit_output}")
@@ -355,6 +384,13 @@ def check_table(table: List[Scenario]) -> None:
             raise SystemExit(f"{where}: the window makes only the edits {WINDOW_EDITS}")
         if scenario.through == "engine" and scenario.edit[0] not in ENGINE_EDITS:
             raise SystemExit(f"{where}: editchild makes only the edits {ENGINE_EDITS}")
+        if scenario.through == "ctl" and scenario.edit[0] not in CTL_COMMANDS:
+            raise SystemExit(f"{where}: ftpconfig-ctl makes only the edits {tuple(CTL_COMMANDS)}")
+        if scenario.refused:
+            # Refused before anything is written: the server does as before.
+            if scenario.changes or scenario.before != scenario.after or scenario.through != "ctl":
+                raise SystemExit(f"{where}: a refused edit (through ctl) changes no file and no login")
+            continue
         if scenario.forecast and (not REPORT or set(scenario.forecast) - set(scenario.after)):
             raise SystemExit(f"{where}: a forecast needs --report and users the after phase logs in")
         if set(scenario.greeting) - {"before", "after"}:
@@ -374,25 +410,27 @@ def check_table(table: List[Scenario]) -> None:
             raise SystemExit(f"{where}: a known fault names the checks it fails")
 
 
-def take_program_options() -> Tuple[Optional[str], Optional[str]]:
-    """--window PROGRAM and --report PROGRAM, taken off the command line
-    before the harness reads the options every script has."""
+def take_program_options() -> Tuple[Optional[str], Optional[str], Optional[str]]:
+    """--window PROGRAM, --report PROGRAM and --ctl PROGRAM, taken off the
+    command line before the harness reads the options every script has."""
     parser = argparse.ArgumentParser(add_help=False)
     parser.add_argument("--window")
     parser.add_argument("--report")
+    parser.add_argument("--ctl")
     known, rest = parser.parse_known_args(sys.argv[1:])
     sys.argv[1:] = rest
-    for program in (known.window, known.report):
+    for program in (known.window, known.report, known.ctl):
         if program and not os.access(program, os.X_OK):
             raise SystemExit(f"saves.py: {program} is not an executable program")
-    return known.window, known.report
+    return known.window, known.report, known.ctl
 
 
 WINDOW: Optional[str] = None
 REPORT: Optional[str] = None
+CTL: Optional[str] = None
 
 if __name__ == "__main__":
-    WINDOW, REPORT = take_program_options()
+    WINDOW, REPORT, CTL = take_program_options()
     tools = (harness.VSFTPD, harness.CHPASSWD, "unshare", "mount")
     defaults = {
         "uploads": [],
@@ -403,5 +441,7 @@ if __name__ == "__main__":
         "through": "engine",
         "forecast": [],
         "greeting": {},
+        "refused": "",
+        "changes": {},
     }
     sys.exit(harness.main(__file__, __doc__, "--edit", tools, defaults, check_table, run_scenario))
