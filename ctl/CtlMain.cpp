@@ -375,10 +375,7 @@ int list(const RootDirectory &root, bool json)
     config.load();
     const Report report = buildReport(config, interaction);
     std::cout.rdbuf(out);
-    if (json)
-        printReportJson(report, root.path(), stdout);
-    else
-        printReportText(report, stdout);
+    printReport(report, root.path(), json, stdout);
     return 0;
 }
 

@@ -292,3 +292,11 @@ void printReportJson(const Report &report, const QString &root, std::FILE *out)
         std::fwrite(piece.constData(), 1, static_cast<size_t>(piece.size()), out);
     });
 }
+
+void printReport(const Report &report, const QString &root, bool json, std::FILE *out)
+{
+    if (json)
+        printReportJson(report, root, out);
+    else
+        printReportText(report, out);
+}

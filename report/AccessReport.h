@@ -56,3 +56,5 @@ void printReportText(const Report &report, std::FILE *out);
 QByteArray reportJson(const Report &report, const QString &root);
 // The same JSON written to the stream as it is made.
 void printReportJson(const Report &report, const QString &root, std::FILE *out);
+// The one or the other, as ftpconfig-report and ftpconfig-ctl list print it.
+void printReport(const Report &report, const QString &root, bool json, std::FILE *out);

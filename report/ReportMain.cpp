@@ -73,10 +73,7 @@ int main(int argc, char **argv)
         }
         const Report report = buildReport(config, interaction);
         std::cout.rdbuf(out);
-        if (json)
-            printReportJson(report, root.path(), stdout);
-        else
-            printReportText(report, stdout);
+        printReport(report, root.path(), json, stdout);
         // Everything is said: taking apart the rows, the accounts and the
         // virtual users one allocation at a time would only make the
         // program slower to end (7% of a run with 110,000 users).

@@ -335,6 +335,9 @@ void TestSave::writerFollowsOnlyRootsLinks_data()
     QTest::newRow("link of another user") << "chown-link" << false;
     QTest::newRow("link in a directory others may write") << "open-dir" << false;
     QTest::newRow("target in a directory others may write") << "open-target-dir" << false;
+    // The backup is written as carefully: a link another user put in its
+    // place leads nowhere, and the file it would keep stays as it is.
+    QTest::newRow("backup path a link of another user") << "chown-backup-link" << false;
 }
 
 void TestSave::writerFollowsOnlyRootsLinks()
@@ -355,6 +358,13 @@ void TestSave::writerFollowsOnlyRootsLinks()
         QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath(QStringLiteral("/etc"))).constData(), 0777), 0);
     if (plant == QLatin1String("open-target-dir"))
         QCOMPARE(::chmod(QFile::encodeName(engine.root.filePath(QStringLiteral("/srv/repo"))).constData(), 0775), 0);
+    const QString backup = link + QLatin1String(".ftpconfig-bak");
+    const QString victim = engine.root.filePath(QStringLiteral("/srv/victim"));
+    if (plant == QLatin1String("chown-backup-link")) {
+        QVERIFY(engine.root.writeFile(QStringLiteral("/srv/victim"), "victim\n"));
+        QVERIFY(QFile::link(victim, backup));
+        QCOMPARE(::lchown(QFile::encodeName(backup).constData(), 1000, 1000), 0);
+    }
     const QByteArray before = engine.root.readFile(QStringLiteral("/srv/repo/vsftpd.conf"));
 
     setValue(engine.config->mainConfig().elements, "", "ftpd_banner", "changed");
@@ -364,8 +374,13 @@ void TestSave::writerFollowsOnlyRootsLinks()
     if (kept) {
         QVERIFY(engine.root.readFile(QStringLiteral("/srv/repo/vsftpd.conf")).contains("ftpd_banner=changed"));
         QCOMPARE(engine.interaction.records.size(), 0);
+        // Kept beside the link, with the mode of the file it leads to.
+        QCOMPARE(engine.root.readFile(QStringLiteral("/etc/vsftpd.conf.ftpconfig-bak")), before);
+        QCOMPARE(statOf(backup).st_mode & 07777, 0600u);
     } else {
         QCOMPARE(engine.root.readFile(QStringLiteral("/srv/repo/vsftpd.conf")), before);
+        QCOMPARE(engine.root.readFile(QStringLiteral("/srv/victim")),
+                 plant == QLatin1String("chown-backup-link") ? QByteArray("victim\n") : QByteArray());
         QCOMPARE(engine.interaction.records.size(), 1);
         QCOMPARE(engine.interaction.records[0].message.text, QStringLiteral("Unable to save /etc/vsftpd.conf"));
         QVERIFY(!engine.interaction.records[0].message.detailedText.isEmpty());
