@@ -644,17 +644,6 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
         result.findings.append({Severity::Warning, pam.file, pam.line, pam.message});
     }
 
-    const AccountStore &accounts = m_config.accounts();
-    const bool guest = m_settings.isYes("guest_enable", false);
-    const QByteArray account = guest ? m_settings.value("guest_username", "ftp") : login;
-    AccountRecord record;
-    if (!accounts.getUserInfo(account, record)) {
-        return deny(m_mainPath, m_settings.line("guest_enable"),
-                    QStringLiteral("PAM admits %1, but there is no system account %1 and guest_enable is off: vsftpd "
-                                   "ends the session")
-                        .arg(text(login)));
-    }
-
     const VsftpdSettings *own = userSettings(login);
     // Named only in a finding: most users have no file of their own.
     const auto ownPath = [&] {
@@ -679,6 +668,26 @@ UserForecast LoginForecast::forecastLogin(const QByteArray &login)
             return own->isYes(key, defaultValue);
         return m_settings.isYes(key, defaultValue);
     };
+
+    // The session becomes its account after the per-user file is read:
+    // guest_enable and guest_username there apply.
+    const AccountStore &accounts = m_config.accounts();
+    const bool guest = yes("guest_enable", false);
+    const auto *guestName = setting("guest_username");
+    const QByteArray account = guest ? (guestName ? guestName->value : QByteArray("ftp")) : login;
+    AccountRecord record;
+    if (!accounts.getUserInfo(account, record)) {
+        if (guest) {
+            return deny(own && own->find("guest_username") ? ownPath() : m_mainPath, guestName ? guestName->line : 0,
+                        QStringLiteral("the guest account %1 (guest_username) does not exist: vsftpd ends the "
+                                       "session (cannot locate user entry)")
+                            .arg(text(account)));
+        }
+        return deny(m_mainPath, m_settings.line("guest_enable"),
+                    QStringLiteral("PAM admits %1, but there is no system account %1 and guest_enable is off: vsftpd "
+                                   "ends the session")
+                        .arg(text(login)));
+    }
 
     bool chrooted = false;
     if (guest && !yes("virtual_use_local_privs", false)) {
