@@ -124,8 +124,9 @@ void FtpServerConfig::loadFtpusers()
     rule.onerr = QByteArray::fromStdString(tokenArgument(*line, "onerr"));
     rule.apply = QByteArray::fromStdString(tokenArgument(*line, "apply"));
     m_ftpusersRule = rule;
+    // A directory in the list's place is no list: reading it would throw.
     std::ifstream in(QFile::encodeName(resolved(rule.file)).toStdString(), std::ios::in | std::ios::binary);
-    if (in.is_open()) {
+    if (in.is_open() && QFileInfo(resolved(rule.file)).isFile()) {
         m_ftpusers.parse(in);
         remember(text(rule.file), m_ftpusers);
     }
