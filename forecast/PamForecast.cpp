@@ -756,8 +756,7 @@ PamForecast::ModuleAnswer PamForecast::runAccess(const Line &line, const QByteAr
             const QList<QByteArray> fields = text.split(separator.at(0));
             if (fields.size() != 3 || (fields[0].trimmed() != "+" && fields[0].trimmed() != "-"))
                 continue; // pam_access passes over a line it cannot read
-            const QString rule
-                = QStringLiteral("the rule \"%1\" (%2:%3)").arg(QString::fromUtf8(text), path).arg(number);
+            const QString rule = QStringLiteral("rule \"%1\" (%2:%3)").arg(QString::fromUtf8(text), path).arg(number);
             QList<QByteArray> users = fields[1].simplified().replace(',', ' ').split(' ');
             users.removeAll(QByteArray());
             const std::optional<bool> userMatch = listMatch(users, 0);
@@ -802,7 +801,7 @@ PamForecast::ModuleAnswer PamForecast::runTime(const QByteArray &user)
         text = text.trimmed();
         if (text.isEmpty())
             continue;
-        const QString rule = QStringLiteral("the rule \"%1\" (%2:%3)").arg(QString::fromUtf8(text), path).arg(number);
+        const QString rule = QStringLiteral("rule \"%1\" (%2:%3)").arg(QString::fromUtf8(text), path).arg(number);
         const QList<QByteArray> fields = text.split(';');
         if (fields.size() != 4 || text.endsWith('\\'))
             return {std::nullopt, QStringLiteral("pam_time's %1, which this forecast cannot read").arg(rule)};
