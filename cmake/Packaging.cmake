@@ -35,8 +35,8 @@ forecast of what vsftpd and PAM will really do. It writes back only the files
 that changed, each atomically.
 .
 The package contains the window (ftpconfig, started from the desktop through
-pkexec), the text and JSON report (ftpconfig-report) and, where built,
-ftpconfig-ctl, which makes the window's edits from a shell.")
+pkexec), the text and JSON report (ftpconfig-report) and ftpconfig-ctl, which
+makes the window's edits from a shell.")
 
 # Read by DebianPackageFiles.cmake while packaging.
 set(CPACK_FTPCONFIG_SOURCE_DIR ${PROJECT_SOURCE_DIR})
