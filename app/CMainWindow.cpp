@@ -5,6 +5,7 @@
 #include "VexHelpMenu.h"
 #include "VexIcon.h"
 #include "dialogs/GuiInteraction.h"
+#include "dialogs/TryLoginDialog.h"
 #include "options/COptionsDialog.h"
 #include "policy/FtpServerConfig.h"
 #include "ui_CMainWindow.h"
@@ -173,6 +174,7 @@ void CMainWindow::setActionIcons()
     m_ui->actionAdd_user->setIcon(themeIcon("list-add-user", ":/prefix/icons/pixel/adduser.png"));
     m_ui->actionDelete_user->setIcon(themeIcon("list-remove-user", ":/prefix/icons/pixel/deleteuser.png"));
     m_ui->actionEdit_user->setIcon(themeIcon("user-properties", ":/prefix/icons/pixel/edituser.png"));
+    m_ui->actionTry_login->setIcon(themeIcon("dialog-password", ":/prefix/icons/pixel/trylogin.png"));
 }
 
 void CMainWindow::restoreWindowState()
@@ -229,6 +231,7 @@ void CMainWindow::createFilterMenu()
     m_filterMenu->addAction(m_ui->actionAdd_user);
     m_filterMenu->addAction(m_ui->actionEdit_user);
     m_filterMenu->addAction(m_ui->actionDelete_user);
+    m_filterMenu->addAction(m_ui->actionTry_login);
 }
 
 void CMainWindow::connectActions()
@@ -236,6 +239,7 @@ void CMainWindow::connectActions()
     connect(m_ui->actionAdd_user, &QAction::triggered, this, &CMainWindow::addUser);
     connect(m_ui->actionDelete_user, &QAction::triggered, this, &CMainWindow::deleteUser);
     connect(m_ui->actionEdit_user, &QAction::triggered, this, &CMainWindow::editUser);
+    connect(m_ui->actionTry_login, &QAction::triggered, this, &CMainWindow::tryLogin);
     connect(m_ui->actionExit, &QAction::triggered, this, &CMainWindow::exit);
     connect(m_ui->actionOptions, &QAction::triggered, this, &CMainWindow::showSettingsDialog);
     connect(m_view, &CMainTreeView::selected, this, &CMainWindow::viewElementActivated);
@@ -442,6 +446,16 @@ void CMainWindow::deleteUser()
     viewElementActivated(m_view->currentIndex());
 }
 
+void CMainWindow::tryLogin()
+{
+    const QModelIndex source = currentSourceIndex();
+    // The shortcut reaches here whatever the row.
+    if (!m_model->isUserRow(source))
+        return;
+    TryLoginDialog dialog(*m_model, source, this);
+    dialog.exec();
+}
+
 void CMainWindow::viewElementActivated(const QModelIndex &index)
 {
     const QModelIndex source = m_proxy->mapToSource(index);
@@ -450,6 +464,7 @@ void CMainWindow::viewElementActivated(const QModelIndex &index)
         && m_model->config().isVirtualUser(name.toUtf8());
     m_ui->actionDelete_user->setVisible(virtualUser);
     m_ui->actionEdit_user->setVisible(virtualUser);
+    m_ui->actionTry_login->setEnabled(m_model->isUserRow(source));
     m_loginCheckDock->showUser(source);
 }
 

@@ -51,6 +51,8 @@ public slots:
     void addUser();
     void deleteUser();
     void editUser();
+    // Tries the selected user's password with PAM and the local server.
+    void tryLogin();
     void viewElementActivated(const QModelIndex &index);
     void exit();
     void showSettingsDialog();

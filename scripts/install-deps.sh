@@ -4,7 +4,7 @@
 #   scripts/install-deps.sh run|test
 set -euo pipefail
 kind=${1:-run}
-run_packages=(cmake ninja-build g++ pkg-config qtbase5-dev qtbase5-dev-tools libdb5.3++-dev vsftpd librsvg2-bin)
+run_packages=(cmake ninja-build g++ pkg-config qtbase5-dev qtbase5-dev-tools libdb5.3++-dev vsftpd librsvg2-bin libpam0g-dev)
 test_packages=(clang libclang-rt-14-dev clang-format db5.3-util pamtester python3 dbus curl util-linux desktop-file-utils libxml2-utils xvfb xauth)
 packages=("${run_packages[@]}")
 [ "$kind" = test ] && packages+=("${test_packages[@]}")
