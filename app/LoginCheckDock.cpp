@@ -1,5 +1,7 @@
 #include "LoginCheckDock.h"
 
+#include "dialogs/ForecastIcons.h"
+#include "dialogs/WrappingDelegate.h"
 #include "forecast/LoginForecast.h"
 #include "policy/AccessFailure.h"
 #include "usertable/TreeModel.h"
@@ -7,49 +9,9 @@
 #include <QApplication>
 #include <QHeaderView>
 #include <QStyle>
-#include <QStyledItemDelegate>
 #include <QTreeWidget>
 
 namespace {
-
-// QTreeView asks for row heights without the column's width, so wrapped
-// text would keep one line: this gives it the width.
-class WrappingDelegate : public QStyledItemDelegate
-{
-public:
-    explicit WrappingDelegate(QTreeView *view)
-        : QStyledItemDelegate(view)
-        , m_view(view)
-    {
-    }
-
-    QSize sizeHint(const QStyleOptionViewItem &option, const QModelIndex &index) const override
-    {
-        // The other columns are sized to their contents, on one line.
-        if (index.column() != LoginCheckDock::MessageColumn)
-            return QStyledItemDelegate::sizeHint(option, index);
-        QStyleOptionViewItem sized = option;
-        sized.rect = QRect(0, 0, qMax(m_view->columnWidth(index.column()), 1), 1 << 16);
-        return QStyledItemDelegate::sizeHint(sized, index);
-    }
-
-private:
-    QTreeView *m_view;
-};
-
-QIcon severityIcon(ForecastFinding::Severity severity)
-{
-    QStyle *style = QApplication::style();
-    switch (severity) {
-    case ForecastFinding::Severity::Error:
-        return style->standardIcon(QStyle::SP_MessageBoxCritical);
-    case ForecastFinding::Severity::Warning:
-        return style->standardIcon(QStyle::SP_MessageBoxWarning);
-    case ForecastFinding::Severity::Info:
-        break;
-    }
-    return style->standardIcon(QStyle::SP_MessageBoxInformation);
-}
 
 QString location(const QString &file, int line)
 {
@@ -78,14 +40,9 @@ LoginCheckDock::LoginCheckDock(QWidget *parent)
     m_tree->setObjectName(QStringLiteral("findingsTreeWidget"));
     m_tree->setHeaderLabels({tr("Check"), tr("Result"), tr("Where"), tr("Message")});
     m_tree->setRootIsDecorated(true);
-    m_tree->setUniformRowHeights(false);
-    m_tree->setWordWrap(true);
-    m_tree->setItemDelegate(new WrappingDelegate(m_tree));
+    WrappingDelegate::install(m_tree, MessageColumn);
     m_tree->setSelectionMode(QAbstractItemView::SingleSelection);
     m_tree->header()->setStretchLastSection(true);
-    // The view keeps the row heights of the old widths: wrapped messages
-    // need a new layout whenever a column changes width.
-    connect(m_tree->header(), &QHeaderView::sectionResized, m_tree, [this] { m_tree->doItemsLayout(); });
     setWidget(m_tree);
 
     // Several signals of one edit make one refresh.
@@ -230,18 +187,7 @@ void LoginCheckDock::addUserPart(const QModelIndex &user)
     if (forecast.findings.isEmpty())
         summary = tr("No findings.");
     setRow(server, {tr("Server forecast"), forecastStatusText(forecast.status), QString(), summary});
-    QStyle *style = QApplication::style();
-    switch (forecast.status) {
-    case ForecastStatus::Allowed:
-        server->setIcon(ResultColumn, style->standardIcon(QStyle::SP_DialogApplyButton));
-        break;
-    case ForecastStatus::Denied:
-        server->setIcon(ResultColumn, style->standardIcon(QStyle::SP_DialogCancelButton));
-        break;
-    case ForecastStatus::Unknown:
-        server->setIcon(ResultColumn, style->standardIcon(QStyle::SP_MessageBoxQuestion));
-        break;
-    }
+    server->setIcon(ResultColumn, forecastStatusIcon(forecast.status));
     for (const ForecastFinding &finding : forecast.findings)
         addFinding(server, finding);
 }

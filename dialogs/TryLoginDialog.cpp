@@ -1,5 +1,7 @@
 #include "TryLoginDialog.h"
 
+#include "ForecastIcons.h"
+#include "WrappingDelegate.h"
 #include "forecast/LoginForecast.h"
 #include "policy/AccessFailure.h"
 #include "ui_TryLoginDialog.h"
@@ -63,7 +65,8 @@ TryLoginDialog::TryLoginDialog(TreeModel &model, const QModelIndex &sourceUser, 
         where += QLatin1Char(' ') + tr("Unsaved changes are not part of this trial.");
     m_ui->whereLabel->setText(where);
 
-    m_ui->stepsTreeWidget->setUniformRowHeights(false);
+    // Replies and refusals run long: they wrap rather than hide their end.
+    WrappingDelegate::install(m_ui->stepsTreeWidget, ReplyColumn);
     m_ui->stepsTreeWidget->header()->setStretchLastSection(true);
     connect(m_ui->tryPushButton, &QPushButton::clicked, this, &TryLoginDialog::start);
     connect(m_ui->buttonBox, &QDialogButtonBox::rejected, this, &QDialog::reject);
@@ -104,8 +107,12 @@ void TryLoginDialog::showVerdict()
     const UserForecast forecast = m_model.forecast(m_user).value_or(UserForecast());
     setRow(forecastItem, tr("Server forecast"), forecastStatusText(forecast.status),
            forecast.findings.isEmpty() ? tr("No findings.") : QString());
-    for (const ForecastFinding &finding : forecast.findings)
-        setRow(new QTreeWidgetItem(forecastItem), QString(), severityText(finding.severity), finding.message);
+    forecastItem->setIcon(ResultColumn, forecastStatusIcon(forecast.status));
+    for (const ForecastFinding &finding : forecast.findings) {
+        auto *item = new QTreeWidgetItem(forecastItem);
+        setRow(item, QString(), severityText(finding.severity), finding.message);
+        item->setIcon(ResultColumn, severityIcon(finding.severity));
+    }
     tree->expandAll();
     tree->resizeColumnToContents(StepColumn);
     tree->resizeColumnToContents(ResultColumn);
