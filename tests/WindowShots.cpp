@@ -11,6 +11,7 @@
 #include "app/VexIntegration.h"
 #include "common/AppStrings.h"
 #include "dialogs/GuiInteraction.h"
+#include "dialogs/TryLoginDialog.h"
 #include "options/COptionsDialog.h"
 #include "policy/FtpServerConfig.h"
 #include "usertable/CMainTreeView.h"
@@ -25,6 +26,7 @@
 #include <QListWidget>
 #include <QMenu>
 #include <QPixmap>
+#include <QSignalSpy>
 #include <QTest>
 
 #include <cstdio>
@@ -115,9 +117,21 @@ int main(int argc, char **argv)
     save(menu, QStringLiteral("filter-menu"));
     menu->hide();
 
+    ModalHelper modal(10000);
+    // "Try login" on the selected user, after a trial with a password.
+    modal.expect(QStringLiteral("Try login: ") + selected, [](QWidget *dialog) {
+        QTest::keyClicks(dialog->findChild<QLineEdit *>(QStringLiteral("passwordLineEdit")), QStringLiteral("secret"));
+        QSignalSpy finished(qobject_cast<TryLoginDialog *>(dialog), &TryLoginDialog::trialFinished);
+        ModalHelper::press(dialog, QStringLiteral("Try login"));
+        finished.wait(10000);
+        QTest::qWait(100);
+        save(dialog, QStringLiteral("try-login"));
+        ModalHelper::press(dialog, QDialogButtonBox::Close);
+    });
+    window.findChild<QAction *>(QStringLiteral("actionTry_login"))->trigger();
+
     // Every question the edit asks on the way is answered with its
     // refusing button; the refusal box is the picture.
-    ModalHelper modal(10000);
     const QString refusal = QStringLiteral("Unable to change access status.");
     modal.expect(refusal, shot(QStringLiteral("window-refusal-box"), QStringLiteral("OK")));
     model.setData(WindowFixture::find(model, refused, TreeModel::StatusColumn), QStringLiteral("allowed"));
