@@ -1,7 +1,7 @@
 // Runs "Try login" for one user through the dialog, on the files of the
 // machine (the end-to-end test gives it a private /etc), and prints every
 // row the dialog shows:
-//   trylogindriver USER < password
+//   trylogindriver USER [PICTURE.png] < password
 // One line a row: depth, step, result and reply, separated by tabs, the
 // lines of a reply joined by " | ". Exits 0 when the trial ran to its end
 // within the time allowed.
@@ -37,8 +37,8 @@ int main(int argc, char **argv)
 {
     QApplication app(argc, argv);
     QCoreApplication::setApplicationName(QStringLiteral("ftpconfig"));
-    if (argc != 2) {
-        std::cerr << "usage: trylogindriver USER < password\n";
+    if (argc != 2 && argc != 3) {
+        std::cerr << "usage: trylogindriver USER [PICTURE.png] < password\n";
         return 2;
     }
     std::string password;
@@ -61,6 +61,9 @@ int main(int argc, char **argv)
     QSignalSpy finished(&dialog, &TryLoginDialog::trialFinished);
     dialog.findChild<QPushButton *>(QStringLiteral("tryPushButton"))->click();
     const bool ended = finished.wait(60000);
+    // A picture of the dialog after a real trial, to look at.
+    if (argc == 3 && !dialog.grab().save(QString::fromLocal8Bit(argv[2])))
+        std::cerr << "trylogindriver: cannot write " << argv[2] << '\n';
     QTreeWidget *tree = dialog.stepsTree();
     for (int row = 0; row < tree->topLevelItemCount(); ++row)
         print(tree->topLevelItem(row), 0);

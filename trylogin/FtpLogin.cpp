@@ -93,7 +93,14 @@ public:
         QString text;
         const int code = reply(&text);
         const bool ok = code != 0 && expected.contains(char('0' + code / 100));
-        step(shown, ok ? TryLoginStep::Outcome::Passed : TryLoginStep::Outcome::Failed, text);
+        // A server that ends the session after a refusal leaves nothing to
+        // quit: no fault of the QUIT.
+        const bool ended = code == 0 && line == "QUIT" && m_socket.state() != QAbstractSocket::ConnectedState;
+        step(shown,
+             ok          ? TryLoginStep::Outcome::Passed
+                 : ended ? TryLoginStep::Outcome::Skipped
+                         : TryLoginStep::Outcome::Failed,
+             text);
         if (replyText)
             *replyText = text;
         return ok ? code : -code - 1;
