@@ -60,6 +60,8 @@ TryLoginDialog::TryLoginDialog(TreeModel &model, const QModelIndex &sourceUser, 
     } else {
         where = tr("User %1. %2").arg(name, m_request.skipReason);
     }
+    if (m_request.anonymous)
+        where += QLatin1Char(' ') + tr("The login is \"anonymous\"; its password is any e-mail address.");
     // The server and PAM read the files on disk, not the edits in memory.
     if (m_model.hasUnsavedChanges())
         where += QLatin1Char(' ') + tr("Unsaved changes are not part of this trial.");

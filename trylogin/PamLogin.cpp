@@ -81,6 +81,11 @@ void tryPamLogin(const TryLoginRequest &request, const TryLoginReport &report)
         step(QStringLiteral("pam_start"), Outcome::Skipped, request.skipReason);
         return;
     }
+    if (request.anonymous) {
+        step(QStringLiteral("pam_start"), Outcome::Skipped,
+             tr("Not run: vsftpd lets anonymous sessions in without PAM."));
+        return;
+    }
     Conversation conversation{&request.password, {}};
     const pam_conv conv{&converse, &conversation};
     pam_handle_t *handle = nullptr;

@@ -16,7 +16,8 @@ QString tr(const char *text)
 TryLoginRequest TryLoginRequest::fromConfig(const FtpServerConfig &config, const QByteArray &user)
 {
     TryLoginRequest request;
-    request.user = user;
+    request.anonymous = config.isAnonymousUser(user);
+    request.user = request.anonymous ? QByteArray("anonymous") : user;
     request.pamService = config.pamServiceName();
     // vsftpd listens on every address unless told one; the loopback one
     // reaches it from here.

@@ -33,6 +33,9 @@ struct TryLoginRequest
     QString address = QStringLiteral("127.0.0.1");
     quint16 port = 21;
     bool tls = false;
+    // The anonymous row: the login is "anonymous", its password any
+    // e-mail address, and vsftpd asks PAM nothing.
+    bool anonymous = false;
     // Empty when PAM and the server of this machine are the ones the
     // configuration describes; otherwise why they are not tried.
     QString skipReason;
