@@ -131,6 +131,11 @@ bool AccountStore::getUserInfo(const QByteArray &name, AccountRecord &record) co
     return true;
 }
 
+const AccountRecord *AccountStore::findAccount(const QByteArray &name) const
+{
+    return m_passwdIndex.value(name);
+}
+
 QByteArray AccountStore::shadowPassword(const QByteArray &name) const
 {
     const AccountRecord *found = m_shadowIndex.value(name);

@@ -45,6 +45,8 @@ public:
     ~AccountStore();
 
     bool getUserInfo(const QByteArray &name, AccountRecord &record) const;
+    // The same without a copy; null when there is no such account.
+    const AccountRecord *findAccount(const QByteArray &name) const;
     QByteArray shadowPassword(const QByteArray &name) const;
     // Exactly "!" or "*" in passwd or shadow: a locked hash ("!$6$...") or
     // "!!" is not bad.

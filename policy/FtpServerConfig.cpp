@@ -135,8 +135,7 @@ bool FtpServerConfig::isChrooted(const QByteArray &user) const
 {
     if (isYes("guest_enable"))
         return true;
-    AccountRecord record;
-    if (!m_accounts || !m_accounts->getUserInfo(user, record))
+    if (!m_accounts || !m_accounts->findAccount(user))
         return true;
     const bool local = isYes("chroot_local_user");
     if (!isYes("chroot_list_enable"))
@@ -162,8 +161,8 @@ QByteArray FtpServerConfig::effectiveRoot(const QByteArray &user) const
 QByteArray FtpServerConfig::configuredRoot(const QByteArray &user) const
 {
     const auto homeOf = [this](const QByteArray &account) {
-        AccountRecord record;
-        return m_accounts && m_accounts->getUserInfo(account, record) ? record.home : QByteArray();
+        const AccountRecord *record = m_accounts ? m_accounts->findAccount(account) : nullptr;
+        return record ? record->home : QByteArray();
     };
     const ConfigFile *own = userConfig(user);
     const auto ownValue = [own](const char *key) -> std::optional<QByteArray> {

@@ -96,6 +96,7 @@ public:
     bool checkUserlist(const QByteArray &user, bool repair, AccessFailure *failure);
     bool checkPassword(const QByteArray &user, bool repair, AccessFailure *failure);
     bool checkPamUserdb(const QByteArray &user, bool interactive, AccessFailure *failure);
+    bool walkPamUserdb(const QByteArray &user, bool interactive, AccessFailure *failure);
 
     bool isAnonymousUser(const QByteArray &user) const;
     bool isVirtualUser(const QByteArray &user) const;
@@ -295,6 +296,7 @@ private:
     bool m_ftpusersIndexValid = false;
     std::optional<bool> m_skipPamCheck;
     bool m_pamSkipped = false;
+    int m_pamQuestions = 0; // asked of the operator so far
     QByteArray m_userlistPath;
     NameList m_userlist;
     bool m_userlistModified = false;
@@ -316,6 +318,8 @@ private:
         // The last user's effective root.
         QByteArray rootUser;
         QByteArray root;
+        // What the PAM file says of every virtual user, with its refusal.
+        std::optional<std::pair<bool, AccessFailure>> pamUserdb;
         QHash<QByteArray, std::optional<QByteArray>> values;
     };
     mutable std::unique_ptr<PassCache> m_pass;

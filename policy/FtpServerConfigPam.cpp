@@ -10,6 +10,7 @@
 #include <QSettings>
 
 #include <iostream>
+#include <tuple>
 
 #ifndef FTPCONFIG_MULTIARCH
 #define FTPCONFIG_MULTIARCH ""
@@ -35,6 +36,29 @@ bool FtpServerConfig::ensureDirectoryOf(const QString &path)
 }
 
 bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, AccessFailure *failure)
+{
+    // The answer is the same for every virtual user of a pass: the PAM file
+    // is walked once, unless the walk asked the operator something (what it
+    // asks is answered once and changes the next walk).
+    if (interactive || !m_pass || !isVirtualUser(user))
+        return walkPamUserdb(user, interactive, failure);
+    if (!m_pass->pamUserdb) {
+        const auto state = std::make_tuple(m_skipPamCheck, m_pamSkipped, m_pamQuestions);
+        AccessFailure found;
+        const bool passed = walkPamUserdb(user, false, &found);
+        if (state != std::make_tuple(m_skipPamCheck, m_pamSkipped, m_pamQuestions)) {
+            if (failure)
+                *failure = found;
+            return passed;
+        }
+        m_pass->pamUserdb.emplace(passed, found);
+    }
+    if (failure && !m_pass->pamUserdb->second.message.isEmpty())
+        *failure = m_pass->pamUserdb->second;
+    return m_pass->pamUserdb->first;
+}
+
+bool FtpServerConfig::walkPamUserdb(const QByteArray &user, bool interactive, AccessFailure *failure)
 {
     // Read once: the table asks for every virtual user.
     if (!m_skipPamCheck)
@@ -71,6 +95,7 @@ bool FtpServerConfig::checkPamUserdb(const QByteArray &user, bool interactive, A
         // A module token of 12 characters or fewer passes without the test.
         if (!sufficient || module == line->tokens.end()
             || (module->text.size() >= 13 && !endsWith(module->text, "pam_userdb.so"))) {
+            ++m_pamQuestions;
             const Interaction::PamChoice choice = m_interaction.askPamProblem();
             if (choice == Interaction::PamChoice::Skip) {
                 m_pamSkipped = true;
