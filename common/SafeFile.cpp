@@ -215,7 +215,7 @@ std::optional<QString> AtomicBatch::add(const QString &path, const QByteArray &c
 }
 
 std::optional<QString> AtomicBatch::addBackup(const QString &path, const QString &trustedTop,
-                                              std::optional<mode_t> keptMode)
+                                              std::optional<mode_t> keptMode, bool changedInPlace)
 {
     QString original;
     std::optional<QString> refused = linkTarget(path, QDir::cleanPath(trustedTop), original);
@@ -229,6 +229,13 @@ std::optional<QString> AtomicBatch::addBackup(const QString &path, const QString
         const int fd = ::open(QFile::encodeName(original).constData(), O_RDONLY | O_NOFOLLOW | O_CLOEXEC);
         if (fd < 0 || ::fstat(fd, &info) != 0 || !S_ISREG(info.st_mode)) {
             refused = systemError("cannot read the file to keep", fd < 0 ? errno : EINVAL);
+        } else if (!changedInPlace && (!keptMode || *keptMode == (info.st_mode & 07777))
+                   && linkBackup(fd, path, trustedTop)) {
+            // The file being replaced becomes the backup itself: nothing is
+            // copied or synced, its mode and owner are its own, and the save
+            // only renames it, like the files it writes.
+            ::close(fd);
+            return std::nullopt;
         } else {
             char buffer[65536];
             ssize_t got;
@@ -259,6 +266,29 @@ std::optional<QString> AtomicBatch::addBackup(const QString &path, const QString
     if (file.fd >= 0)
         ++m_open;
     return file.error;
+}
+
+bool AtomicBatch::linkBackup(int fd, const QString &path, const QString &trustedTop)
+{
+    QString target;
+    if (linkTarget(backupPath(path), QDir::cleanPath(trustedTop), target))
+        return false; // the copy reports why
+    const QFileInfo info(target);
+    const QByteArray stem
+        = QFile::encodeName(info.absolutePath()) + "/." + QFile::encodeName(info.fileName()) + ".ftpconfig-";
+    for (int attempt = 0; attempt < 16; ++attempt) {
+        const QByteArray temporary
+            = stem + QByteArray::number(QRandomGenerator::global()->generate() & 0xffffff, 36).rightJustified(6, '0');
+        // The inode that was opened and checked, not whatever the name
+        // leads to by now.
+        if (::linkat(fd, "", AT_FDCWD, temporary.constData(), AT_EMPTY_PATH) == 0) {
+            m_files.push_back(Pending{QFile::encodeName(target), temporary, -1, std::nullopt});
+            return true;
+        }
+        if (errno != EEXIST)
+            return false; // another file system, or no right to link: copied instead
+    }
+    return false;
 }
 
 void AtomicBatch::syncOpenFiles()
@@ -330,10 +360,11 @@ QString backupPath(const QString &path)
     return path + QStringLiteral(".ftpconfig-bak");
 }
 
-std::optional<QString> writeBackup(const QString &path, const QString &trustedTop, std::optional<mode_t> keptMode)
+std::optional<QString> writeBackup(const QString &path, const QString &trustedTop, std::optional<mode_t> keptMode,
+                                   bool changedInPlace)
 {
     AtomicBatch batch;
-    if (const auto refused = batch.addBackup(path, trustedTop, keptMode))
+    if (const auto refused = batch.addBackup(path, trustedTop, keptMode, changedInPlace))
         return refused;
     return batch.commit().front();
 }

@@ -42,9 +42,13 @@ public:
                                const QString &trustedTop = QStringLiteral("/"));
     // The temporary file of backupPath(path): a copy of the file at path
     // (through a link root made, as a write would follow it), with the
-    // original's mode, or keptMode when given, and its owner.
+    // original's mode, or keptMode when given, and its owner. Where it can,
+    // the original itself is linked under the backup's name (the save
+    // replaces it by a new file, so its old content stays as it was).
+    // A file that is changed in place afterwards (a database) is always
+    // copied.
     std::optional<QString> addBackup(const QString &path, const QString &trustedTop = QStringLiteral("/"),
-                                     std::optional<mode_t> keptMode = std::nullopt);
+                                     std::optional<mode_t> keptMode = std::nullopt, bool changedInPlace = false);
     // Replaces the targets; one result per add(), in the order of the calls,
     // a refused add() keeping its reason. The batch is empty afterwards.
     std::vector<std::optional<QString>> commit();
@@ -60,6 +64,9 @@ public:
 
 private:
     void syncOpenFiles();
+    // Links the open original as the temporary file of its backup; false
+    // when that cannot be done and a copy is needed.
+    bool linkBackup(int fd, const QString &path, const QString &trustedTop);
 
     std::vector<Pending> m_files;
     int m_open = 0;
@@ -71,7 +78,7 @@ QString backupPath(const QString &path);
 // Copies the file at path to backupPath(path) as AtomicBatch::addBackup
 // does, written at once; nothing on success, otherwise why not.
 std::optional<QString> writeBackup(const QString &path, const QString &trustedTop = QStringLiteral("/"),
-                                   std::optional<mode_t> keptMode = std::nullopt);
+                                   std::optional<mode_t> keptMode = std::nullopt, bool changedInPlace = false);
 
 // Why a name may not become a file name in a directory of ours or a line of
 // a list, or nothing when it may: an empty name, "/", a leading ".", a

@@ -303,7 +303,7 @@ bool FtpServerConfig::save()
         if (m_accounts) {
             const QString database = resolved(m_dbPath);
             if (m_accounts->virtualUsersChanged() && QFileInfo(database).isFile()) {
-                if (const auto error = writeBackup(database, trustedTop(m_root), 0600))
+                if (const auto error = writeBackup(database, trustedTop(m_root), 0600, true))
                     throw std::runtime_error(
                         tr("the previous version could not be kept: %1").arg(*error).toLocal8Bit().toStdString());
             }

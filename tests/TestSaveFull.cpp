@@ -88,6 +88,12 @@ void TestSaveFull::fullFileSystem()
     // list could be created: an empty file needs no room.
     FileMap afterFailure = root.files();
     afterFailure.remove(QStringLiteral("/filler"));
+    // A backup is the replaced file linked under another name and needs no
+    // room: one may be there, the same as the file it keeps.
+    for (const QString &path : afterFailure.keys()) {
+        if (path.endsWith(QLatin1String(".ftpconfig-bak")))
+            QCOMPARE(afterFailure.take(path), before.value(path.chopped(14)));
+    }
     QCOMPARE(afterFailure.take(QStringLiteral("/etc/vsftpd.chroot_list")), QByteArray(""));
     QCOMPARE(afterFailure, before);
 
