@@ -329,15 +329,6 @@ QModelIndex CMainWindow::currentSourceIndex() const
     return m_proxy->mapToSource(m_view->currentIndex());
 }
 
-namespace {
-
-std::optional<QByteArray> livePassword(const FtpServerConfig &config, const QByteArray &name)
-{
-    return config.accounts().livePassword(name);
-}
-
-} // namespace
-
 bool CMainWindow::runVirtualUserDialog(CreateVUserDialog &dialog)
 {
     for (QLineEdit *field : {dialog.nameLineEdit(), dialog.passwordLineEdit(), dialog.confirmationLineEdit()})
@@ -362,7 +353,7 @@ void CMainWindow::addUser()
     if (!runVirtualUserDialog(dialog))
         return;
     const QByteArray name = dialog.userName().toUtf8();
-    if (livePassword(m_model->config(), name)) {
+    if (m_model->config().accounts().livePassword(name)) {
         QMessageBox::warning(this, windowTitle(),
                              tr("User %1 allready exists in users database.").arg(dialog.userName()));
         return;
@@ -394,7 +385,7 @@ void CMainWindow::editUser()
         return;
     }
     const QString oldName = m_model->userName(source);
-    const auto oldPassword = livePassword(m_model->config(), oldName.toUtf8());
+    const auto oldPassword = m_model->config().accounts().livePassword(oldName.toUtf8());
     if (!oldPassword) {
         QMessageBox::warning(this, windowTitle(),
                              tr("Unable to find information about virtual user %1 in database.").arg(oldName));
@@ -408,7 +399,7 @@ void CMainWindow::editUser()
     const QByteArray password = dialog.password().toUtf8();
     if (name == oldName.toUtf8() && password == *oldPassword)
         return;
-    if (name != oldName.toUtf8() && livePassword(m_model->config(), name)) {
+    if (name != oldName.toUtf8() && m_model->config().accounts().livePassword(name)) {
         QMessageBox::warning(this, windowTitle(),
                              tr("User %1 allready exists in users database.").arg(dialog.userName()));
         return;

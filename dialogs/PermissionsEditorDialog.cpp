@@ -1,5 +1,6 @@
 #include "PermissionsEditorDialog.h"
 
+#include "ComboBoxes.h"
 #include "common/AppStrings.h"
 #include "policy/FtpServerConfig.h"
 #include "ui_PermissionsEditorDialog.h"
@@ -13,17 +14,6 @@
 namespace {
 
 const QString separator = QStringLiteral(", ");
-
-// An account or group the store does not know shows as its number.
-void selectOrAdd(QComboBox *combo, const QString &name)
-{
-    int found = combo->findText(name);
-    if (found < 0) {
-        combo->addItem(name);
-        found = combo->count() - 1;
-    }
-    combo->setCurrentIndex(found);
-}
 
 } // namespace
 

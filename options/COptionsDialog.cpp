@@ -3,6 +3,7 @@
 #include "app/VexIcon.h"
 #include "app/VexIntegration.h"
 #include "common/AppStrings.h"
+#include "dialogs/ComboBoxes.h"
 #include "policy/FtpServerConfig.h"
 #include "ui_COptionsDialog.h"
 
@@ -80,18 +81,6 @@ bool hasControlCharacter(const QByteArray &text)
             return true;
     }
     return false;
-}
-
-// A value the widget has no entry for (an account the store does not know,
-// an address of another machine) still shows, and stays as it was.
-void selectOrAdd(QComboBox *combo, const QString &text)
-{
-    int found = combo->findText(text);
-    if (found < 0) {
-        combo->addItem(text);
-        found = combo->count() - 1;
-    }
-    combo->setCurrentIndex(found);
 }
 
 QIcon resourceIcon(const QString &name)
