@@ -12,8 +12,6 @@
 #include <QCoreApplication>
 #include <QDir>
 #include <QFileInfo>
-#include <QProcess>
-#include <QTemporaryFile>
 
 #include <cstdio>
 #include <cstdlib>
@@ -276,25 +274,6 @@ void setRights(FtpServerConfig &config, const QByteArray &user, const QString &a
         refuse(QStringLiteral("Unable to change user permissions."));
 }
 
-// "diff -u" of the two texts, with a/ and b/ headers.
-QByteArray unifiedDiff(const FtpServerConfig::PlannedFile &file)
-{
-    QTemporaryFile before;
-    QTemporaryFile after;
-    if (!before.open() || !after.open() || before.write(file.current) != file.current.size()
-        || after.write(file.next) != file.next.size() || !before.flush() || !after.flush())
-        throw Exit{1, QStringLiteral("cannot write a temporary file for the diff")};
-    const QString relative = file.path.startsWith(QLatin1Char('/')) ? file.path.mid(1) : file.path;
-    QProcess diff;
-    diff.start(QStringLiteral("diff"),
-               {QStringLiteral("-u"), QStringLiteral("--label"),
-                file.exists ? QStringLiteral("a/") + relative : QStringLiteral("/dev/null"), QStringLiteral("--label"),
-                QStringLiteral("b/") + relative, before.fileName(), after.fileName()});
-    if (!diff.waitForFinished(60000) || diff.exitStatus() != QProcess::NormalExit || diff.exitCode() > 1)
-        throw Exit{1, QStringLiteral("diff failed: %1").arg(QString::fromLocal8Bit(diff.readAllStandardError()))};
-    return diff.readAllStandardOutput();
-}
-
 void printPlan(const FtpServerConfig::SavePlan &plan)
 {
     const auto line = [](const QString &text) { std::printf("%s\n", text.toLocal8Bit().constData()); };
@@ -311,11 +290,7 @@ void printPlan(const FtpServerConfig::SavePlan &plan)
     for (const QByteArray &name : plan.removedVirtualUsers)
         line(QStringLiteral("virtual user removed from %1: %2").arg(database, QString::fromUtf8(name)));
     for (const FtpServerConfig::PlannedFile &file : plan.files) {
-        QByteArray diff = unifiedDiff(file);
-        // diff says nothing of a new empty file (a list with no names yet):
-        // its headers alone say that it is made.
-        if (diff.isEmpty() && !file.exists)
-            diff = "--- /dev/null\n+++ b/" + QFile::encodeName(file.path.mid(1)) + '\n';
+        const QByteArray diff = file.diff();
         std::fwrite(diff.constData(), 1, static_cast<size_t>(diff.size()), stdout);
     }
 }

@@ -161,6 +161,9 @@ public:
         QByteArray current; // on disk now; empty when the file does not exist yet
         QByteArray next; // what the save writes
         bool exists = false;
+        // "diff -u" from the file as it is, a/ and b/ before the path; a
+        // new empty file, of which diff says nothing, shows its headers.
+        QByteArray diff() const;
     };
     // What save() would write now, in its order, computed by the same steps
     // and writing nothing. The virtual users database shows only names.

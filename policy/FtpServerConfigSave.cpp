@@ -1,6 +1,7 @@
 // Saving of FtpServerConfig: every store written back through one writer.
 #include "FtpServerConfig.h"
 #include "FtpServerConfigInternal.h"
+#include "UnifiedDiff.h"
 
 #include "common/AppStrings.h"
 #include "common/SafeFile.h"
@@ -205,6 +206,15 @@ FtpServerConfig::SaveWork FtpServerConfig::prepareSave(ConfigFile &main) const
     const QString mainPath = AppStrings::instance().mainConfigPath;
     document(mainPath, m_root.resolve(mainPath), main, QString());
     return work;
+}
+
+QByteArray FtpServerConfig::PlannedFile::diff() const
+{
+    const QByteArray relative = QFile::encodeName(path.startsWith(QLatin1Char('/')) ? path.mid(1) : path);
+    const QByteArray to = "b/" + relative;
+    const QByteArray from = exists ? "a/" + relative : QByteArrayLiteral("/dev/null");
+    const QByteArray text = unifiedDiff(current, next, from, to);
+    return text.isEmpty() && !exists ? "--- " + from + "\n+++ " + to + '\n' : text;
 }
 
 FtpServerConfig::SavePlan FtpServerConfig::planSave() const

@@ -1,7 +1,9 @@
 #include "CaptureStream.h"
 #include "EngineFixture.h"
+#include "Process.h"
 #include "TestMain.h"
 #include "common/SafeFile.h"
+#include "policy/UnifiedDiff.h"
 
 #include <QStandardPaths>
 #include <QtTest>
@@ -71,6 +73,8 @@ private slots:
     void batchReportsEachFile();
     void hiddenFilesAreNoUsers();
     void serverReadsTheProgramsUserlist();
+    void diffAsDiffWritesIt_data();
+    void diffAsDiffWritesIt();
 };
 
 void TestSave::initTestCase()
@@ -472,4 +476,61 @@ void TestSave::serverReadsTheProgramsUserlist()
 }
 
 FTPCONFIG_TEST_GUILESS_MAIN(TestSave)
+// What a save shows before it writes is the program's own diff: GNU diff
+// gives the same text where the shortest edit is unique, and patch turns
+// every one of them into the new file.
+void TestSave::diffAsDiffWritesIt_data()
+{
+    QTest::addColumn<QByteArray>("before");
+    QTest::addColumn<QByteArray>("after");
+    QTest::addColumn<bool>("sameAsGnu");
+
+    QByteArray many;
+    QByteArray shuffled;
+    for (int i = 0; i < 5000; ++i) {
+        many += "user" + QByteArray::number(i) + '\n';
+        shuffled += "user" + QByteArray::number((i * 7919) % 5000) + '\n';
+    }
+    QTest::newRow("one line changed") << QByteArray("a\nb\nc\nd\ne\nf\ng\nh\n")
+                                      << QByteArray("a\nb\nc\nd\nE\nf\ng\nh\n") << true;
+    QTest::newRow("changes near and far")
+        << QByteArray("1\n2\n3\n4\n5\n6\n7\n8\n9\n10\n11\n12\n13\n14\n15\n16\n17\n18\n19\n20\n")
+        << QByteArray("0\n1\n2\n3\n4\n6\n7\n8\n9\n10\n11\n12\n13\n14\n15\n16\n17\n18\n19\n20\nend\n") << true;
+    QTest::newRow("new file") << QByteArray() << QByteArray("listen=YES\n") << true;
+    QTest::newRow("emptied") << QByteArray("a\nb\n") << QByteArray() << true;
+    QTest::newRow("newline added at the end") << QByteArray("a\nb") << QByteArray("a\nb\n") << true;
+    QTest::newRow("newline lost at the end") << QByteArray("a\nb\nc\n") << QByteArray("a\nb\nc") << true;
+    QTest::newRow("line added after one without newline") << QByteArray("a") << QByteArray("a\nb") << true;
+    QTest::newRow("name appended to a long list") << many << many + "bob\n" << true;
+    QTest::newRow("beyond the edit limit") << many << shuffled << false;
+}
+
+void TestSave::diffAsDiffWritesIt()
+{
+    QFETCH(QByteArray, before);
+    QFETCH(QByteArray, after);
+    QFETCH(bool, sameAsGnu);
+
+    const QByteArray diff = unifiedDiff(before, after, "a/etc/f", "b/etc/f");
+    QCOMPARE(unifiedDiff(before, before, "a/etc/f", "b/etc/f"), QByteArray());
+    QString why;
+    const FileMap patched = patchedFiles({{QStringLiteral("/etc/f"), before}}, diff, why);
+    QVERIFY2(why.isEmpty(), qPrintable(why + QString::fromUtf8(diff)));
+    QCOMPARE(patched.value(QStringLiteral("/etc/f")), after);
+    if (sameAsGnu) {
+        QTemporaryDir dir;
+        QFile a(dir.filePath(QStringLiteral("a")));
+        QFile b(dir.filePath(QStringLiteral("b")));
+        QVERIFY(a.open(QIODevice::WriteOnly) && a.write(before) == before.size() && b.open(QIODevice::WriteOnly)
+                && b.write(after) == after.size());
+        a.close();
+        b.close();
+        const ProcessResult gnu
+            = runProcess(QStringLiteral("diff"),
+                         {QStringLiteral("-u"), QStringLiteral("--label"), QStringLiteral("a/etc/f"),
+                          QStringLiteral("--label"), QStringLiteral("b/etc/f"), a.fileName(), b.fileName()});
+        QCOMPARE(QString::fromUtf8(diff), QString::fromUtf8(gnu.out));
+    }
+}
+
 #include "TestSave.moc"

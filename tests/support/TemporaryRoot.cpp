@@ -1,4 +1,5 @@
 #include "TemporaryRoot.h"
+#include "Process.h"
 
 #include <QDir>
 #include <QDirIterator>
@@ -77,4 +78,33 @@ FileMap regularFiles(const QString &directory)
         files.insert(name, file.open(QIODevice::ReadOnly) ? file.readAll() : QByteArray("<unreadable>"));
     }
     return files;
+}
+
+FileMap patchedFiles(const FileMap &files, const QByteArray &diff, QString &why)
+{
+    QTemporaryDir patched;
+    for (auto it = files.begin(); it != files.end(); ++it) {
+        QDir().mkpath(QFileInfo(patched.path() + it.key()).absolutePath());
+        QFile file(patched.path() + it.key());
+        if (!file.open(QIODevice::WriteOnly) || file.write(*it) != it->size()) {
+            why = QStringLiteral("cannot write ") + file.fileName();
+            return {};
+        }
+    }
+    const QList<QByteArray> lines = diff.split('\n');
+    for (int i = 1; i + 1 < lines.size(); ++i) {
+        if (lines[i - 1] == "--- /dev/null" && lines[i].startsWith("+++ b/") && !lines[i + 1].startsWith("@@")) {
+            const QString path = patched.path() + QFile::decodeName(lines[i].mid(5));
+            QDir().mkpath(QFileInfo(path).absolutePath());
+            QFile(path).open(QIODevice::WriteOnly);
+        }
+    }
+    const ProcessResult patch
+        = runProcess(QStringLiteral("patch"),
+                     {QStringLiteral("-p1"), QStringLiteral("-s"), QStringLiteral("-d"), patched.path()}, diff, 30000);
+    if (!patch.finished || patch.exitCode != 0) {
+        why = QString::fromLocal8Bit(patch.out + patch.err);
+        return {};
+    }
+    return regularFiles(patched.path());
 }

@@ -12,6 +12,11 @@ using FileMap = QMap<QString, QByteArray>;
 // database environment (/var/lib/ftpconfig/), which recovers on its own.
 FileMap regularFiles(const QString &directory);
 
+// The files with a unified diff (a/ and b/ before the paths) applied by
+// patch; a new empty file, of which a diff shows the headers only, is made
+// empty. Empty, with the reason in why, when patch refuses the diff.
+FileMap patchedFiles(const FileMap &files, const QByteArray &diff, QString &why);
+
 // A private directory that stands for "/" in a test: files are named by the
 // absolute paths the program knows them by and land below the directory.
 class TemporaryRoot
