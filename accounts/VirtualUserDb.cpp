@@ -85,9 +85,9 @@ VirtualUserDb::VirtualUserDb(const QByteArray &databasePath, const RootDirectory
     const int slash = databasePath.lastIndexOf('/');
     const QByteArray directory = slash < 0 ? QByteArray("./") : databasePath.left(slash + 1);
     QByteArray fileName = slash < 0 ? databasePath : databasePath.mid(slash + 1);
-    // pam_userdb appends ".db" to its db= argument, so the PAM file names
-    // the path without it.
-    if (!fileName.isEmpty() && !fileName.endsWith(".db"))
+    // pam_userdb appends ".db" to its db= argument whatever it ends in:
+    // "db=/x/users.db" opens /x/users.db.db, and so does the program.
+    if (!fileName.isEmpty())
         fileName += ".db";
 
     if (m_access == Access::ReadWrite && !QDir().mkpath(fromLocal(m_root.resolve(directory)))) {

@@ -41,8 +41,8 @@ public:
 
     enum class Access { ReadWrite, ReadOnly };
 
-    // Derives the file path from the configured one (".db" appended unless
-    // present), creates its directory and opens. Throws std::runtime_error
+    // Derives the file path from the configured one (".db" appended, as
+    // pam_userdb does), creates its directory and opens. Throws std::runtime_error
     // when the directory cannot be created. ReadOnly creates nothing: no
     // directory, no environment, no file; a missing file reads as empty.
     VirtualUserDb(const QByteArray &databasePath, const RootDirectory &root, Access access = Access::ReadWrite);
@@ -65,8 +65,9 @@ public:
     // The deletes, then the puts, all in one transaction. Throws DbException.
     void apply(const QList<QByteArray> &deletes, const QList<std::pair<QByteArray, QByteArray>> &puts);
 
-    // Drops the database file (after copying it beside itself) and the
-    // environment's logs and regions, then opens afresh.
+    // Drops the file the configured path names as written (after copying
+    // it beside itself), never the one opened, which has ".db" appended;
+    // then the environment's logs and regions, and opens afresh.
     void recreate(const QByteArray &configuredPath);
 
     // Paths as the administrator knows them.

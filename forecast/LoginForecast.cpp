@@ -216,34 +216,19 @@ void LoginForecast::checkServer()
 
 void LoginForecast::checkUserdbFile(const QByteArray &service, const ConfigFile *serviceFile)
 {
-    // pam_userdb appends ".db" to its db= argument whatever it ends in; the
-    // account store reads a name that ends in ".db" as written, so that the
-    // program then lists and edits another file than the one the server
-    // reads. The forecast of every virtual user reads the server's.
+    // pam_userdb appends ".db" to its db= argument whatever it ends in, and
+    // the program reads the same file; a value that ends in ".db" most
+    // likely means the file without the second one, which nobody reads.
     if (!serviceFile)
         return;
     const QByteArray db = QByteArray::fromStdString(moduleArgument(serviceFile->elements, "pam_userdb.so", "db"));
     if (!db.endsWith(".db"))
         return;
-    const QByteArray opened = db + ".db";
-    QString held = QStringLiteral("%1 cannot be opened, and pam_userdb knows no virtual user").arg(text(opened));
-    if (const QSet<QByteArray> *users = m_pam->userdbKeys(opened)) {
-        QList<QByteArray> names = users->values();
-        std::sort(names.begin(), names.end());
-        QStringList shown;
-        for (const QByteArray &name : names.mid(0, 20))
-            shown.append(text(name));
-        if (names.size() > 20)
-            shown.append(QStringLiteral("..."));
-        held = QStringLiteral("the server's virtual users are those of %1 (%2): %3")
-                   .arg(text(opened))
-                   .arg(names.size())
-                   .arg(shown.join(QLatin1String(", ")));
-    }
-    m_serverFindings.append({Severity::Warning, QStringLiteral("/etc/pam.d/") + text(service), 0,
-                             QStringLiteral("pam_userdb opens %1 (db=%2 with \".db\" appended), but this program "
-                                            "lists and edits %2; %3")
-                                 .arg(text(opened), text(db), held)});
+    QString message = QStringLiteral("pam_userdb and this program read %1 (db=%2 with \".db\" appended)")
+                          .arg(text(db + ".db"), text(db));
+    if (QFileInfo::exists(m_config.root().resolve(text(db))))
+        message += QStringLiteral("; neither reads %1").arg(text(db));
+    m_serverFindings.append({Severity::Warning, QStringLiteral("/etc/pam.d/") + text(service), 0, message});
 }
 
 void LoginForecast::checkSecureChrootDir()

@@ -481,29 +481,30 @@ const QHash<QByteArray, int> *PamForecast::listEntries(const QByteArray &file)
     return it->second ? &*it->second : nullptr;
 }
 
-const QSet<QByteArray> *PamForecast::userdbKeys(const QByteArray &path)
+const QSet<QByteArray> *PamForecast::userdbKeys(const QByteArray &db)
 {
+    const QByteArray file = db + ".db";
     // The database the account store has read, untouched since, is the one
     // pam_userdb would open: its names are not read a second time.
     const VirtualUserDb *stored = m_accounts.database();
-    if (stored && stored->isOpen() && stored->filePath() == path && !m_accounts.virtualUsersChanged())
+    if (stored && stored->isOpen() && stored->filePath() == file && !m_accounts.virtualUsersChanged())
         return &m_accounts.virtualUserKeys();
-    auto it = m_userdbs.find(path);
+    auto it = m_userdbs.find(file);
     if (it == m_userdbs.end()) {
         std::optional<QSet<QByteArray>> keys;
-        if (QFileInfo(resolved(QString::fromUtf8(path))).isFile()) {
+        if (QFileInfo(resolved(QString::fromUtf8(file))).isFile()) {
             try {
-                VirtualUserDb db(path, m_root, VirtualUserDb::Access::ReadOnly);
-                if (db.isOpen()) {
+                VirtualUserDb store(db, m_root, VirtualUserDb::Access::ReadOnly);
+                if (store.isOpen()) {
                     keys.emplace();
-                    for (const auto &record : db.readAll())
+                    for (const auto &record : store.readAll())
                         keys->insert(record.first);
                 }
             } catch (const std::exception &) {
                 keys.reset();
             }
         }
-        it = m_userdbs.emplace(path, keys).first;
+        it = m_userdbs.emplace(file, keys).first;
     }
     return it->second ? &*it->second : nullptr;
 }
@@ -515,7 +516,7 @@ PamForecast::ModuleAnswer PamForecast::runUserdb(const Line &line, const QByteAr
         return {ServiceErr, QStringLiteral("pam_userdb has no db= argument")};
     // pam_userdb always appends ".db": "db=/x/users.db" opens /x/users.db.db.
     const QByteArray file = db + ".db";
-    const QSet<QByteArray> *keys = userdbKeys(file);
+    const QSet<QByteArray> *keys = userdbKeys(db);
     if (!keys) {
         return {AuthinfoUnavail,
                 QStringLiteral("pam_userdb cannot open %1 (db=%2 with \".db\" appended)")

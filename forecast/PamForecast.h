@@ -63,9 +63,9 @@ public:
     const QList<Note> &notes();
     // A session stack that holds pam_mkhomedir makes a missing home.
     bool sessionMakesHome();
-    // The names in the database file pam_userdb opens (its path with
-    // ".db"), read once; null when it cannot be opened.
-    const QSet<QByteArray> *userdbKeys(const QByteArray &path);
+    // The names in the database file pam_userdb opens for the argument
+    // db= (its value with ".db"), read once; null when it cannot be opened.
+    const QSet<QByteArray> *userdbKeys(const QByteArray &db);
 
     // Codes a module answers with, by their names in "[value=action]".
     enum Code {

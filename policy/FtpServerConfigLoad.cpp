@@ -20,11 +20,16 @@ void FtpServerConfig::load()
     const QByteArray db = QByteArray::fromStdString(moduleArgument(m_pam.elements, "pam_userdb.so", "db"));
     if (db.isEmpty()) {
         const AppStrings &strings = AppStrings::instance();
+        // Named as a db= argument would name the default file: the fix
+        // writes it so, with the file's ".db" taken off.
         m_dbConfiguredPath = QFile::encodeName(strings.stateDirectory + QLatin1Char('/') + strings.virtualUsersDbName);
+        if (m_dbConfiguredPath.endsWith(".db"))
+            m_dbConfiguredPath.chop(3);
     } else {
         m_dbConfiguredPath = db;
     }
-    m_dbPath = m_dbConfiguredPath.endsWith(".db") ? m_dbConfiguredPath : m_dbConfiguredPath + ".db";
+    // The file pam_userdb opens: ".db" appended whatever db= ends in.
+    m_dbPath = m_dbConfiguredPath + ".db";
     loadUserlist();
     loadFtpusers();
     loadChrootList();
@@ -174,8 +179,8 @@ void FtpServerConfig::loadVirtualUsers()
     const auto access = m_mode == Mode::ReadOnly ? AccountStore::Access::ReadOnly : AccountStore::Access::ReadWrite;
     m_accounts = std::make_unique<AccountStore>(QByteArray(), m_root, access);
     try {
-        // As the PAM file writes it: a recovery deletes the configured path
-        // as written, and with ".db" appended here that would be the very
+        // As the PAM file writes it: the store appends ".db" as pam_userdb
+        // does, and its recovery deletes the path as written, never the
         // file pam_userdb reads.
         m_accounts->loadVirtualUsers(m_dbConfiguredPath);
     } catch (const std::exception &e) {

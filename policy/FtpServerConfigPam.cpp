@@ -114,8 +114,9 @@ bool FtpServerConfig::walkPamUserdb(const QByteArray &user, bool interactive, Ac
         for (auto argument = std::next(module); argument != line->tokens.end(); ++argument) {
             if (argument->text.compare(0, 3, "db=") != 0)
                 continue;
+            // The file pam_userdb opens: ".db" appended whatever db= ends in.
             QByteArray path = QByteArray::fromStdString(argument->text.substr(3));
-            if (!path.isEmpty() && !path.endsWith(".db"))
+            if (!path.isEmpty())
                 path += ".db";
             if (pathStatus(path))
                 continue;
@@ -155,8 +156,10 @@ bool FtpServerConfig::walkPamUserdb(const QByteArray &user, bool interactive, Ac
 
 bool FtpServerConfig::fixPamUserdb()
 {
+    // The file pam_userdb opens: accepted as it stands, the trailing ".db"
+    // taken off below gives back the same db= value.
     QString initial = QString::fromStdString(moduleArgument(m_pam.elements, "pam_userdb.so", "db"));
-    if (!initial.isEmpty() && !initial.endsWith(QLatin1String(".db")))
+    if (!initial.isEmpty())
         initial += QLatin1String(".db");
     const std::optional<QString> entered
         = m_interaction.askPath(tr("Enter new virtual users database file path:"), initial);

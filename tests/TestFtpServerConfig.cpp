@@ -52,7 +52,12 @@ QString describeLoaded(FtpServerConfig &config)
                                         + rule->apply)
                     : QStringLiteral("none"));
     parts << QStringLiteral("ftpusers=") + QString::fromStdString(config.ftpusersList().text());
-    parts << QStringLiteral("db=") + QString::fromUtf8(config.virtualUsersDbPath());
+    // The store must edit the file the save backs up (and pam_userdb opens).
+    QString db = QStringLiteral("db=") + QString::fromUtf8(config.virtualUsersDbPath());
+    const VirtualUserDb *store = config.accounts().database();
+    if (store && store->filePath() != config.virtualUsersDbPath())
+        db += QStringLiteral("!=") + QString::fromUtf8(store->filePath());
+    parts << db;
     parts << QStringLiteral("main=") + QString::fromStdString(config.mainConfig().text());
     return parts.join(QLatin1Char(';')).replace(QLatin1Char('\n'), QLatin1Char('/')) + QLatin1Char(';');
 }
@@ -278,6 +283,14 @@ void TestFtpServerConfig::pamUserdb()
         : pam;
     QCOMPARE(QByteArray::fromStdString(engine.config->pamConfig().text()), after);
     QCOMPARE(engine.interaction.texts(), scenario.values(QStringLiteral("text")));
+    if (scenario.has(QStringLiteral("initial"))) {
+        QStringList offered;
+        for (const auto &record : engine.interaction.records) {
+            if (record.kind == QLatin1String("path"))
+                offered << record.choices.value(1);
+        }
+        QCOMPARE(offered, scenario.values(QStringLiteral("initial")));
+    }
     QVERIFY(engine.interaction.allAnswersUsed());
     QCOMPARE(QSettings().value(QStringLiteral("skip_pam_check"), false).toBool(), skipAfter);
     // Local users are never looked at.

@@ -77,8 +77,8 @@ private slots:
     void unusableDirectory();
     void damaged_data();
     void damaged();
-    void recreateKeepsOnlyEdits_data();
-    void recreateKeepsOnlyEdits();
+    void recreateDeletesAsWritten_data();
+    void recreateDeletesAsWritten();
     void readOnlyCreatesNothing();
 };
 
@@ -157,7 +157,7 @@ void TestVirtualUserDb::readsWhatDbLoadWrote()
     QVERIFY(root.write());
     QVERIFY(root.writeVirtualUsers(QStringLiteral("/srv/db/users.db"),
                                    {{"x", "pass word"}, {"yvonne", "\xc3\xa9t\xc3\xa9"}}));
-    const AccountStore store("/srv/db/users.db", RootDirectory(root.path()));
+    const AccountStore store("/srv/db/users", RootDirectory(root.path()));
     QCOMPARE(describe(store.virtualUsers()), QString::fromUtf8("x=pass word//Unchanged yvonne=été//Unchanged"));
 }
 
@@ -168,7 +168,8 @@ void TestVirtualUserDb::filePaths_data()
     QTest::addColumn<bool>("opens");
 
     QTest::newRow("without suffix") << QByteArray("/srv/db/users") << QByteArray("/srv/db/users.db") << true;
-    QTest::newRow("with suffix") << QByteArray("/srv/db/users.db") << QByteArray("/srv/db/users.db") << true;
+    // pam_userdb appends ".db" whatever the name ends in, and so must the store.
+    QTest::newRow("with suffix") << QByteArray("/srv/db/users.db") << QByteArray("/srv/db/users.db.db") << true;
     QTest::newRow("other suffix") << QByteArray("/srv/db/users.DB") << QByteArray("/srv/db/users.DB.db") << true;
     QTest::newRow("directory") << QByteArray("/srv/db/") << QByteArray("/srv/db/") << false;
     QTest::newRow("no slash") << QByteArray("users") << QByteArray("./users.db") << true;
@@ -222,15 +223,19 @@ void TestVirtualUserDb::unusableDirectory()
 void TestVirtualUserDb::damaged_data()
 {
     QTest::addColumn<QString>("damage");
-    QTest::newRow("truncated database") << "truncate";
-    QTest::newRow("garbage database") << "garbage";
-    QTest::newRow("garbage environment") << "environment";
-    QTest::newRow("database is a directory") << "directory";
+    QTest::addColumn<bool>("recovers");
+    // A damaged database file is never deleted: the recovery deletes the
+    // configured path as written, and the file opened has ".db" appended.
+    QTest::newRow("truncated database") << "truncate" << false;
+    QTest::newRow("garbage database") << "garbage" << false;
+    QTest::newRow("garbage environment") << "environment" << true;
+    QTest::newRow("database is a directory") << "directory" << false;
 }
 
 void TestVirtualUserDb::damaged()
 {
     QFETCH(QString, damage);
+    QFETCH(bool, recovers);
 
     FixtureRoot root;
     QVERIFY(root.write());
@@ -261,7 +266,7 @@ void TestVirtualUserDb::damaged()
     AccountStore store({}, RootDirectory(root.path()));
     bool loaded = true;
     try {
-        store.loadVirtualUsers(DbPath + ".db");
+        store.loadVirtualUsers(DbPath);
     } catch (const std::exception &) {
         loaded = false;
     }
@@ -269,52 +274,52 @@ void TestVirtualUserDb::damaged()
         QVERIFY2(!err.text().empty(), "a failed load must say why on standard error");
 
     store.addVirtualUser("fresh", "new-password");
-    if (damage == QLatin1String("directory")) {
-        // Nothing can be written where a directory stands: the save says so.
+    if (!recovers) {
+        // Nothing can be written there: the save says so, and the users
+        // the file still holds are left for the administrator.
         QVERIFY_EXCEPTION_THROWN(store.saveVirtualUsers(), std::exception);
-        QVERIFY(QFileInfo(file).isDir());
+        QVERIFY(store.database()->lastBackupPath().isEmpty());
+        if (damage == QLatin1String("directory"))
+            QVERIFY(QFileInfo(file).isDir());
+        else
+            QCOMPARE(root.readFile(DbFile), oldBytes);
         return;
     }
     store.saveVirtualUsers();
 
     const QByteArray text = QByteArray::fromStdString(err.text());
-    if (damage != QLatin1String("environment") || !loaded) {
+    if (!loaded) {
         for (const char *line : {"Db env. error. Re-creating database\n", "Closing db...\nRemoving db...\n",
                                  "Home db: /var/lib/ftpconfig\n", "Iniit db...\n"})
             QVERIFY2(text.contains(line), text.constData());
-        const QByteArray backup = store.database()->lastBackupPath();
-        QVERIFY2(backup.startsWith(DbPath + ".db.bak-"), backup.constData());
-        QVERIFY(text.contains("Keeping a copy of the old database in " + backup + '\n'));
-        QCOMPARE(root.readFile(QString::fromUtf8(backup)), oldBytes);
-        QCOMPARE(fileMode(root.filePath(QString::fromUtf8(backup))), 0600);
     }
-    QVERIFY(dumped(file).contains(QStringLiteral("fresh=new-password")));
+    QVERIFY(dumped(file).contains(QStringLiteral("fresh=new-password user0=password0 user1=password1 ")));
     QCOMPARE(fileMode(file), 0600);
 }
 
-void TestVirtualUserDb::recreateKeepsOnlyEdits_data()
+void TestVirtualUserDb::recreateDeletesAsWritten_data()
 {
     QTest::addColumn<QByteArray>("configured");
-    QTest::addColumn<QString>("afterSave");
     QTest::addColumn<QString>("copy");
 
-    // Re-creation deletes the file by the path as configured: without the
-    // suffix it deletes nothing and the old records stay.
-    QTest::newRow("configured with .db") << DbPath + ".db"
-                                         << "ben=b2"
-                                         << "anna=a1 ben=b1";
-    QTest::newRow("configured without .db") << DbPath << "anna=a1 ben=b2"
-                                            << "";
+    // Re-creation deletes the file by the path as configured, never the
+    // one opened (".db" appended): the old records stay. A file that the
+    // path as written names is kept as a copy, then deleted.
+    QTest::newRow("configured with .db, a file as written") << DbPath + ".db"
+                                                            << "old=o1";
+    QTest::newRow("configured without .db") << DbPath << "";
 }
 
-void TestVirtualUserDb::recreateKeepsOnlyEdits()
+void TestVirtualUserDb::recreateDeletesAsWritten()
 {
     QFETCH(QByteArray, configured);
-    QFETCH(QString, afterSave);
     QFETCH(QString, copy);
 
     FixtureRoot root;
     QVERIFY(root.write());
+    const QString live = QString::fromUtf8(configured + ".db");
+    if (!copy.isEmpty())
+        QVERIFY(root.writeVirtualUsers(QString::fromUtf8(configured), {{"old", "o1"}}));
     {
         AccountStore store(configured, RootDirectory(root.path()));
         store.addVirtualUser("anna", "a1");
@@ -328,10 +333,10 @@ void TestVirtualUserDb::recreateKeepsOnlyEdits()
         CaptureStream err(std::cerr);
         later.recreateVirtualUserDb();
         later.syncVirtualUsers();
-        // Unchanged records are not rewritten; the copy still has them.
-        QCOMPARE(dumped(root.filePath(DbFile)), afterSave);
+        QCOMPARE(dumped(root.filePath(live)), QStringLiteral("anna=a1 ben=b2"));
         const QByteArray backup = later.database()->lastBackupPath();
         QCOMPARE(backup.isEmpty(), copy.isEmpty());
+        QVERIFY(!root.exists(QString::fromUtf8(configured)));
         if (!copy.isEmpty())
             QCOMPARE(dumped(root.filePath(QString::fromUtf8(backup))), copy);
         QVERIFY(
