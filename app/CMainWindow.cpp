@@ -5,6 +5,7 @@
 #include "VexHelpMenu.h"
 #include "VexIcon.h"
 #include "dialogs/GuiInteraction.h"
+#include "dialogs/SavePreviewDialog.h"
 #include "dialogs/TryLoginDialog.h"
 #include "options/COptionsDialog.h"
 #include "policy/FtpServerConfig.h"
@@ -134,7 +135,7 @@ void CMainWindow::build()
     m_view->setContextMenuPolicy(Qt::CustomContextMenu);
     connect(m_view, &QWidget::customContextMenuRequested, this, &CMainWindow::contextMenuRequested);
 
-    connect(m_ui->actionSave, &QAction::triggered, m_model, &TreeModel::onSave);
+    connect(m_ui->actionSave, &QAction::triggered, this, &CMainWindow::save);
 
     updateStartStopAction(m_server.running());
     connect(m_ui->actionStartStopService, &QAction::triggered, this, &CMainWindow::startStopService);
@@ -283,8 +284,8 @@ void CMainWindow::startStopService()
             QMessageBox::Yes | QMessageBox::No | QMessageBox::Cancel);
         if (answer == QMessageBox::Cancel)
             return;
-        if (answer == QMessageBox::Yes)
-            m_model->onSave();
+        if (answer == QMessageBox::Yes && !save())
+            return;
     }
     if (!m_server.start()) {
         QMessageBox box(QMessageBox::NoIcon, windowTitle(),
@@ -292,6 +293,20 @@ void CMainWindow::startStopService()
                         this);
         box.exec();
     }
+}
+
+bool CMainWindow::save()
+{
+    FtpServerConfig::SavePlan plan = m_model->config().planSave();
+    // An edit undone by hand leaves nothing to show: the save only
+    // clears the unsaved state.
+    if (!plan.files.empty() || !plan.virtualUsersPath.isEmpty()) {
+        SavePreviewDialog preview(std::move(plan), this);
+        if (preview.exec() != QDialog::Accepted)
+            return false;
+    }
+    m_model->onSave();
+    return true;
 }
 
 void CMainWindow::contextMenuRequested(const QPoint &pos)
@@ -527,9 +542,11 @@ void CMainWindow::closeEvent(QCloseEvent *event)
             event->ignore();
             return;
         }
+        if (answer == QMessageBox::Yes && !save()) {
+            event->ignore();
+            return;
+        }
         event->accept();
-        if (answer == QMessageBox::Yes)
-            m_model->onSave();
     } else {
         event->accept();
     }

@@ -43,6 +43,9 @@ public:
     LoginCheckDock *loginCheckDock() const;
 
 public slots:
+    // Shows what the save will write and saves on the administrator's
+    // word; false when it was cancelled.
+    bool save();
     void startStopService();
     void contextMenuRequested(const QPoint &pos);
     void toggleSystemUsers(bool hide);

@@ -6,6 +6,7 @@
 #include "app/VexIntegration.h"
 #include "common/AppStrings.h"
 #include "dialogs/PermissionsEditorDialog.h"
+#include "dialogs/SavePreviewDialog.h"
 #include "policy/FtpServerConfig.h"
 #include "usertable/CreateVUserDialog.h"
 #include "usertable/MyEditor.h"
@@ -17,6 +18,8 @@
 #include <QHeaderView>
 #include <QLabel>
 #include <QLineEdit>
+#include <QListWidget>
+#include <QPlainTextEdit>
 #include <QPushButton>
 #include <QToolBar>
 #include <QTreeWidget>
@@ -137,11 +140,19 @@ private Q_SLOTS:
         QTest::addColumn<QString>("answer");
         QTest::addColumn<bool>("done"); // closed, or started
         QTest::addColumn<bool>("saved");
-        QTest::newRow("close, Cancel keeps the window and writes no setting") << true << "Cancel" << false << false;
-        QTest::newRow("close, No closes unsaved and still writes the settings") << true << "No" << true << false;
-        QTest::newRow("start, Cancel: neither saved nor started") << false << "Cancel" << false << false;
-        QTest::newRow("start, No: started unsaved") << false << "No" << true << false;
-        QTest::newRow("start, Yes: saved, then started") << false << "Yes" << true << true;
+        QTest::addColumn<QString>("preview"); // the button pressed in the preview of the save
+        QTest::newRow("close, Cancel keeps the window and writes no setting")
+            << true << "Cancel" << false << false << QString();
+        QTest::newRow("close, No closes unsaved and still writes the settings")
+            << true << "No" << true << false << QString();
+        QTest::newRow("close, Yes and Save: saved and closed") << true << "Yes" << true << true << "Save";
+        QTest::newRow("close, Yes but the preview cancelled: the window stays")
+            << true << "Yes" << false << false << "Cancel";
+        QTest::newRow("start, Cancel: neither saved nor started") << false << "Cancel" << false << false << QString();
+        QTest::newRow("start, No: started unsaved") << false << "No" << true << false << QString();
+        QTest::newRow("start, Yes: saved, then started") << false << "Yes" << true << true << "Save";
+        QTest::newRow("start, Yes but the preview cancelled: not started")
+            << false << "Yes" << false << false << "Cancel";
     }
 
     void unsavedChanges()
@@ -150,6 +161,7 @@ private Q_SLOTS:
         QFETCH(QString, answer);
         QFETCH(bool, done);
         QFETCH(bool, saved);
+        QFETCH(QString, preview);
         QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
         QVERIFY(m_f.action("actionSave")->isEnabled());
         QVERIFY(m_f.window->findChild<QLabel *>(QStringLiteral("unsavedChangesLabel"))->isVisible());
@@ -157,10 +169,14 @@ private Q_SLOTS:
         ModalHelper modal;
         if (closing) {
             modal.expect(QStringLiteral("Do you want to save changes?"), answer);
+            if (!preview.isNull())
+                modal.expect(QStringLiteral("Save changes"), preview);
             QCOMPARE(m_f.window->close(), done);
         } else {
             modal.expect(QStringLiteral("You have unsaved changes. Do you want to save them before service start?"),
                          answer);
+            if (!preview.isNull())
+                modal.expect(QStringLiteral("Save changes"), preview);
             // The service fails to start here, which is how a start shows.
             if (done)
                 modal.expect(QString(), QStringLiteral("OK"));
@@ -579,8 +595,92 @@ private Q_SLOTS:
                 m_f.window->model()->userName(m_f.window->proxy()->mapToSource(m_f.window->view()->currentIndex())),
                 typed.at(0));
         QCOMPARE(m_f.action("actionSave")->isEnabled(), message.isNull());
-        m_f.action("actionSave")->trigger();
+        // A disabled action still triggers when told to; a person cannot.
+        if (message.isNull()) {
+            modal.expect(QStringLiteral("Save changes"), QDialogButtonBox::Save);
+            m_f.action("actionSave")->trigger();
+            QVERIFY2(modal.done(), qPrintable(modal.report()));
+        }
         QCOMPARE(database(), saved);
+    }
+
+    void savePreview_data()
+    {
+        QTest::addColumn<bool>("accepted");
+        QTest::newRow("Save writes what was shown; the backups undo it") << true;
+        QTest::newRow("Cancel writes nothing") << false;
+    }
+
+    // Every kind of file a save writes: the main file and a new userlist (a
+    // denial), a per-user file (rights), the database (names only).
+    void savePreview()
+    {
+        QFETCH(bool, accepted);
+        FtpServerConfig &config = m_f.window->model()->config();
+        const FileMap original = m_f.root->files();
+        config.accounts().addVirtualUser("vera", "veras-secret");
+        config.accounts().changeVirtualUser("carol", "carol", "carols-secret");
+        config.accounts().removeVirtualUser("dave");
+        QVERIFY(config.setUserRights("carol", QStringLiteral("download")));
+        QVERIFY(m_f.setStatus(QStringLiteral("bob"), QStringLiteral("denied")));
+        const FileMap before = m_f.root->files();
+
+        QStringList entries;
+        QByteArray diffs;
+        QString users;
+        ModalHelper modal;
+        modal.expect(QStringLiteral("Save changes"), [&](QWidget *widget) {
+            auto *preview = qobject_cast<SavePreviewDialog *>(widget);
+            for (int row = 0; row < preview->filesList()->count(); ++row) {
+                preview->filesList()->setCurrentRow(row);
+                entries << preview->filesList()->item(row)->text();
+                const QString shown = preview->diffView()->toPlainText();
+                if (row + 1 < preview->filesList()->count())
+                    diffs += shown.toUtf8();
+                else
+                    users = shown;
+            }
+            ModalHelper::press(widget, accepted ? QDialogButtonBox::Save : QDialogButtonBox::Cancel);
+        });
+        m_f.action("actionSave")->trigger();
+        QVERIFY2(modal.done(), qPrintable(modal.report()));
+
+        QCOMPARE(entries.join(QLatin1Char('|')),
+                 QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf (new file)|/etc/vsftpd.chroot_list (new file)|"
+                                "/etc/vsftpd.d/users.d/carol|/etc/vsftpd.conf|/etc/vsftpd/virtual.db (virtual users)"));
+        for (const char *line : {"added: vera", "new password: carol", "removed: dave"})
+            QVERIFY2(users.contains(QLatin1String(line)), qPrintable(users));
+        QVERIFY(!users.contains(QLatin1String("secret")) && !diffs.contains("secret"));
+        QCOMPARE(m_f.action("actionSave")->isEnabled(), !accepted);
+        if (!accepted) {
+            QCOMPARE(m_f.root->files(), before);
+            return;
+        }
+
+        const FileMap after = m_f.root->files();
+        QString why;
+        FileMap patched = patchedFiles(before, diffs, why);
+        QVERIFY2(why.isEmpty(), qPrintable(why + QString::fromUtf8(diffs)));
+        for (const QString &path : after.keys()) {
+            if (!path.endsWith(QLatin1String(".db")) && !path.endsWith(QLatin1String(".ftpconfig-bak")))
+                QVERIFY2(patched.value(path) == after.value(path), qPrintable(path));
+        }
+        QCOMPARE(m_f.window->model()->config().virtualUserNames(), (QList<QByteArray>{"carol", "vera"}));
+
+        // Going back as the README says: each backup copied over its file.
+        // A per-user file the rights made at once has none.
+        for (const QString &path : after.keys()) {
+            if (!path.endsWith(QLatin1String(".ftpconfig-bak")))
+                continue;
+            const QString original = path.chopped(int(qstrlen(".ftpconfig-bak")));
+            QVERIFY(m_f.root->writeFile(original, after.value(path)));
+        }
+        FileMap restored = m_f.root->files();
+        for (const QString &path : restored.keys()) {
+            if (path.endsWith(QLatin1String(".ftpconfig-bak")) || !original.contains(path))
+                restored.remove(path);
+        }
+        QCOMPARE(restored, original);
     }
 
     void noVirtualUserSelected_data()
@@ -629,7 +729,7 @@ private:
 
     QStringList database() const
     {
-        const AccountStore store(WindowFixture::virtualDb.toUtf8(), RootDirectory(m_f.root->path()),
+        const AccountStore store(QByteArray("/etc/vsftpd/virtual"), RootDirectory(m_f.root->path()),
                                  AccountStore::Access::ReadOnly);
         QStringList records;
         for (const auto &[name, record] : store.virtualUsers())

@@ -23,6 +23,7 @@
 #include "app/Server.h"
 #include "common/AppStrings.h"
 #include "dialogs/PAMDialog.h"
+#include "dialogs/SavePreviewDialog.h"
 #include "dialogs/SelectDirectoryOwnerDialog.h"
 #include "options/COptionsDialog.h"
 #include "policy/FtpServerConfig.h"
@@ -190,6 +191,11 @@ private:
             return fill(dialog);
         if (auto *dialog = qobject_cast<COptionsDialog *>(widget))
             return fill(dialog);
+        if (qobject_cast<SavePreviewDialog *>(widget)) {
+            if (!ModalHelper::press(widget, QDialogButtonBox::Save))
+                refuse(widget, QStringLiteral("no Save button"));
+            return;
+        }
         if (auto *input = qobject_cast<QInputDialog *>(widget)) {
             auto *edit = input->findChild<QLineEdit *>();
             if (m_inputs.isEmpty() || !edit)

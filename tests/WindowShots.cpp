@@ -210,6 +210,23 @@ int main(int argc, char **argv)
     options.load();
     options.exec();
 
+    // The preview of a save that adds a virtual user and changes the
+    // selected user's rights; cancelled, so nothing is written.
+    model.config().accounts().addVirtualUser("newcomer", "secret");
+    model.config().setUserRights(selected.toUtf8(), QStringLiteral("download"));
+    model.setUnsavedChanges(true);
+    modal.expect(QStringLiteral("Save changes"), [](QWidget *preview) {
+        auto *files = preview->findChild<QListWidget *>(QStringLiteral("filesListWidget"));
+        files->setCurrentRow(files->count() > 2 ? 2 : 0); // the main file, likely
+        QTest::qWait(100);
+        save(preview, QStringLiteral("save-preview"));
+        files->setCurrentRow(files->count() - 1);
+        QTest::qWait(50);
+        save(preview, QStringLiteral("save-preview-users"));
+        ModalHelper::press(preview, QDialogButtonBox::Cancel);
+    });
+    window.save();
+
     if (!modal.done()) {
         std::fprintf(stderr, "%s\n", qPrintable(modal.report()));
         return 1;
