@@ -23,8 +23,8 @@ struct ParsedAction
 };
 
 const char *const CodeNames[]
-    = {"success",          "auth_err",    "user_unknown", "authinfo_unavail", "acct_expired",
-       "new_authtok_reqd", "perm_denied", "ignore",       "service_err",      "module_unknown"};
+    = {"success",     "auth_err", "user_unknown", "authinfo_unavail", "acct_expired", "new_authtok_reqd",
+       "perm_denied", "ignore",   "service_err",  "module_unknown",   "cred_err"};
 
 ParsedAction parseAction(const QByteArray &text)
 {
@@ -921,10 +921,124 @@ PamForecast::ModuleAnswer PamForecast::runModule(const Line &line, const QByteAr
     return {std::nullopt, QStringLiteral("%1, which this forecast does not model").arg(QString::fromUtf8(module))};
 }
 
-PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const QByteArray &user)
+std::optional<PamForecast::Code> PamForecast::setcredAnswer(const Line &line, std::optional<Code> authenticated)
+{
+    // Tried with pamtester on Debian 12's Linux-PAM 1.5.2.
+    if (!line.broken.isEmpty())
+        return PermDenied;
+    if (line.missing)
+        return ModuleUnknown;
+    const QByteArray &module = line.module;
+    if (module == "pam_permit.so" || module == "pam_listfile.so" || module == "pam_userdb.so"
+        || module == "pam_shells.so" || module == "pam_env.so")
+        return Success;
+    // With likeauth pam_unix repeats what it answered to the authentication.
+    if (module == "pam_unix.so")
+        return authenticated && line.args.contains("likeauth") ? *authenticated : Success;
+    if (module == "pam_deny.so")
+        return CredErr;
+    if (module == "pam_succeed_if.so" || module == "pam_access.so" || module == "pam_nologin.so")
+        return Ignore;
+    // Any other module is taken to answer as it did to the authentication.
+    return authenticated;
+}
+
+PamForecast::Result PamForecast::setcredStack(const QList<Line> &lines, const std::vector<std::optional<Code>> &frozen,
+                                              int &budget)
+{
+    // Linux-PAM calls every line again, acting on what each answered to
+    // pam_authenticate, but a success must come from the pam_setcred
+    // answers; a line that did not run then acts on its new answer.
+    std::function<Result(int, State, std::optional<Code>)> walk
+        = [&](int i, State state, std::optional<Code> forced) -> Result {
+        QString ignored; // the lines whose success pam_setcred ignores
+        for (; i < lines.size(); ++i) {
+            const Line &line = lines[i];
+            const std::optional<Code> &authenticated = frozen[static_cast<size_t>(i)];
+            std::optional<Code> code = forced ? forced : setcredAnswer(line, authenticated);
+            forced.reset();
+            if (!code) {
+                const QString rule = QStringLiteral("what %1 answers to pam_setcred, which this forecast does "
+                                                    "not model")
+                                         .arg(QString::fromUtf8(line.module));
+                if (--budget < 0)
+                    return {Outcome::Unknown, line.file, line.line, rule};
+                const Result yes = walk(i, state, Success);
+                const Result no = walk(i, state, CredErr);
+                if (yes.outcome == no.outcome)
+                    return no.outcome == Outcome::Failure ? no : yes;
+                return {Outcome::Unknown, line.file, line.line, QStringLiteral("the outcome depends on %1").arg(rule)};
+            }
+            const Code acted = authenticated ? *authenticated : *code;
+            const auto &parsed = line.parsedActions[static_cast<size_t>(acted)];
+            const ParsedAction action{static_cast<Action>(parsed.first), parsed.second};
+            switch (action.action) {
+            case Action::Ignore:
+                break;
+            case Action::Ok:
+            case Action::Done:
+            case Action::Jump:
+                if (state.impression == State::Undecided
+                    || (state.impression == State::Positive && state.status == Success)) {
+                    if (*code != Ignore || acted == Ignore) {
+                        state.impression = State::Positive;
+                        state.status = *code;
+                        state.decidingLine = i;
+                    } else if (ignored.isEmpty()) {
+                        ignored = QStringLiteral("%1 (%2:%3)")
+                                      .arg(QString::fromUtf8(line.module), line.file)
+                                      .arg(line.line);
+                    }
+                }
+                if (action.action == Action::Done && state.impression == State::Positive)
+                    i = lines.size();
+                if (action.action == Action::Jump)
+                    i += action.jump;
+                break;
+            case Action::Bad:
+            case Action::Die:
+                if (state.impression != State::Negative) {
+                    state.impression = State::Negative;
+                    state.status = *code == Ignore ? PermDenied : *code;
+                    state.decidingLine = i;
+                }
+                if (action.action == Action::Die)
+                    i = lines.size();
+                break;
+            case Action::Reset:
+                state = State();
+                state.status = PermDenied;
+                break;
+            }
+        }
+        if (state.impression == State::Positive && state.status == Success)
+            return {Outcome::Success, QString(), 0, QString()};
+        Result refused{Outcome::Failure, QStringLiteral("/etc/pam.d/") + m_service, 0,
+                       QStringLiteral("no auth line answers success to pam_setcred")};
+        if (state.decidingLine >= 0) {
+            const Line &line = lines[state.decidingLine];
+            refused.file = line.file;
+            refused.line = line.line;
+            refused.message = QStringLiteral("%1 answers %2 to pam_setcred")
+                                  .arg(QString::fromUtf8(line.module), QLatin1String(CodeNames[state.status]));
+        }
+        if (!ignored.isEmpty())
+            refused.message += QStringLiteral(" (%1 admitted the user, but ignores pam_setcred)").arg(ignored);
+        refused.message = QStringLiteral("PAM setcred refuses, after the account stack: ") + refused.message;
+        return refused;
+    };
+    State initial;
+    initial.status = PermDenied;
+    return walk(0, initial, std::nullopt);
+}
+
+PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const QByteArray &user, bool setcred)
 {
     const QList<Line> lines = stack(facility);
     std::vector<std::optional<ModuleAnswer>> answers(static_cast<size_t>(lines.size()));
+    // What each line answered on the path being walked: the chain
+    // pam_authenticate freezes for pam_setcred.
+    std::vector<std::optional<Code>> frozen(static_cast<size_t>(lines.size()));
     int budget = 64;
 
     // Walks the stack as Linux-PAM does; a module that is not modelled is
@@ -941,13 +1055,16 @@ PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const
             if (!code) {
                 if (--budget < 0)
                     return {Outcome::Unknown, line.file, line.line, answer->reason};
+                std::fill(frozen.begin() + i, frozen.end(), std::nullopt);
                 const Result yes = walk(i, state, Success);
+                std::fill(frozen.begin() + i, frozen.end(), std::nullopt);
                 const Result no = walk(i, state, AuthErr);
                 if (yes.outcome == no.outcome)
                     return no.outcome == Outcome::Failure ? no : yes;
                 return {Outcome::Unknown, line.file, line.line,
                         QStringLiteral("the outcome depends on %1").arg(answer->reason)};
             }
+            frozen[static_cast<size_t>(i)] = code;
             const auto &parsed = line.parsedActions[static_cast<size_t>(*code)];
             const ParsedAction action{static_cast<Action>(parsed.first), parsed.second};
             const QString reason = answer->code ? answer->reason : QString();
@@ -1004,6 +1121,13 @@ PamForecast::Result PamForecast::evaluateStack(const QByteArray &facility, const
             ++i;
         }
         if (state.impression == State::Positive && state.status == Success) {
+            if (setcred) {
+                Result credentials = setcredStack(lines, frozen, budget);
+                if (credentials.outcome != Outcome::Success) {
+                    credentials.credentials = true;
+                    return credentials;
+                }
+            }
             const Line &line = lines[state.decidingLine];
             return {Outcome::Success, line.file, line.line, QString()};
         }
@@ -1028,11 +1152,16 @@ PamForecast::Result PamForecast::evaluate(const QByteArray &user)
     notes();
     if (m_startFails)
         return {Outcome::Failure, m_startFails->file, m_startFails->line, m_startFails->message};
-    const Result auth = evaluateStack("auth", user);
-    if (auth.outcome != Outcome::Success)
+    const Result auth = evaluateStack("auth", user, true);
+    if (auth.outcome != Outcome::Success && !auth.credentials)
         return auth;
     const Result account = evaluateStack("account", user);
-    if (!m_sessions || account.outcome == Outcome::Failure)
+    if (account.outcome == Outcome::Failure)
+        return account;
+    // vsftpd asks for the credentials after the account stack.
+    if (auth.outcome != Outcome::Success)
+        return auth;
+    if (!m_sessions)
         return account;
     // vsftpd opens the session last; its refusal ends the login as well.
     const Result session = evaluateStack("session", user);

@@ -14,13 +14,14 @@
 #include <functional>
 #include <map>
 #include <optional>
+#include <vector>
 
 class AccountStore;
 
 // What Linux-PAM will answer for one user who types the right password,
 // from the service file and the files its modules read, as vsftpd asks it:
-// the auth and the account stacks, and the session stack when vsftpd opens
-// sessions (session_support). Linux-PAM's own fallbacks are followed: a
+// the auth and the account stacks, pam_setcred over the auth stack, and the
+// session stack when vsftpd opens sessions (session_support). Linux-PAM's own fallbacks are followed: a
 // missing service file and a type the file has no line of take
 // /etc/pam.d/other, a missing module fails its line, a missing @include
 // fails every login. Modelled: the controls required, requisite,
@@ -41,6 +42,7 @@ public:
         QString file; // where the deciding line is, as the administrator knows it
         int line = 0; // 1-based
         QString message; // why, in a sentence
+        bool credentials = false; // the refusal is pam_setcred's, asked after the account stack
     };
 
     // What the service's files make of every login, said once: a file
@@ -56,9 +58,12 @@ public:
     PamForecast(const RootDirectory &root, const AccountStore &accounts, const QString &service,
                 const ConfigFile *serviceFile, bool sessions, QDate today = QDate::currentDate());
 
-    // "auth", "account", then "session" when sessions are opened.
+    // "auth", "account", pam_setcred, then "session" when sessions are
+    // opened.
     Result evaluate(const QByteArray &user);
-    Result evaluateStack(const QByteArray &facility, const QByteArray &user);
+    // With setcred, a path through the auth stack that admits the user is
+    // replayed as pam_setcred replays it.
+    Result evaluateStack(const QByteArray &facility, const QByteArray &user, bool setcred = false);
     // Builds the stacks vsftpd runs and says what they fall back to.
     const QList<Note> &notes();
     // A session stack that holds pam_mkhomedir makes a missing home.
@@ -79,6 +84,7 @@ public:
         Ignore,
         ServiceErr,
         ModuleUnknown,
+        CredErr,
         CodeCount
     };
 
@@ -129,6 +135,11 @@ private:
     ModuleAnswer runUnix(const Line &line, const QByteArray &user);
     ModuleAnswer runListfile(const Line &line, const QByteArray &user);
     ModuleAnswer runUserdb(const Line &line, const QByteArray &user);
+    // A module's answer to pam_setcred, given what it answered to
+    // pam_authenticate (none: it did not run); none when not modelled.
+    static std::optional<Code> setcredAnswer(const Line &line, std::optional<Code> authenticated);
+    // pam_setcred over the auth stack frozen by one path of the walk.
+    Result setcredStack(const QList<Line> &lines, const std::vector<std::optional<Code>> &frozen, int &budget);
     // The entries of a pam_listfile list, each with the line it first
     // appears on; null when the file cannot be read.
     const QHash<QByteArray, int> *listEntries(const QByteArray &file);
