@@ -42,6 +42,7 @@ std::optional<struct stat> FtpServerConfig::fileStatus(const QString &resolvedPa
     };
     if (!m_pass)
         return read();
+    const std::lock_guard<std::mutex> lock(m_pass->statusLock);
     auto it = m_pass->metadata.constFind(resolvedPath);
     if (it == m_pass->metadata.constEnd())
         it = m_pass->metadata.insert(resolvedPath, read());
@@ -69,10 +70,16 @@ std::optional<struct stat> FtpServerConfig::pathStatus(const QByteArray &path) c
 {
     if (!m_pass)
         return fileStatus(resolved(path));
-    auto it = m_pass->paths.constFind(path);
-    if (it == m_pass->paths.constEnd())
-        it = m_pass->paths.insert(path, fileStatus(resolved(path)));
-    return *it;
+    {
+        const std::lock_guard<std::mutex> lock(m_pass->statusLock);
+        const auto it = m_pass->paths.constFind(path);
+        if (it != m_pass->paths.constEnd())
+            return *it;
+    }
+    const auto status = fileStatus(resolved(path));
+    const std::lock_guard<std::mutex> lock(m_pass->statusLock);
+    m_pass->paths.insert(path, status);
+    return status;
 }
 
 std::optional<QByteArray> FtpServerConfig::mainValue(const QByteArray &key) const
@@ -120,7 +127,15 @@ bool FtpServerConfig::isAnonymousUser(const QByteArray &user) const
 
 bool FtpServerConfig::isVirtualUser(const QByteArray &user) const
 {
-    return m_accounts && m_accounts->isVirtualUser(user);
+    if (!m_accounts)
+        return false;
+    if (!m_pass)
+        return m_accounts->isVirtualUser(user);
+    if (m_pass->virtualQuery.isNull() || m_pass->virtualQuery != user) {
+        m_pass->virtualQuery = user;
+        m_pass->virtualAnswer = m_accounts->isVirtualUser(user);
+    }
+    return m_pass->virtualAnswer;
 }
 
 FtpServerConfig::UserlistMode FtpServerConfig::userlistMode() const

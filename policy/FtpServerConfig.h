@@ -16,6 +16,7 @@
 
 #include <map>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <utility>
 #include <vector>
@@ -316,8 +317,15 @@ private:
     // values by key. None when no pass is open.
     struct PassCache
     {
+        // The file metadata is shared with a forecast that may run on
+        // another thread during the pass; the rest is the verdict's own.
+        std::mutex statusLock;
         QHash<QString, std::optional<struct stat>> metadata;
         QHash<QByteArray, std::optional<struct stat>> paths;
+        // Whether the last user asked about is a virtual one: a check asks
+        // several times, and the set of 100,000 names is slow to reach.
+        QByteArray virtualQuery;
+        bool virtualAnswer = false;
         // The last user's effective root.
         QByteArray rootUser;
         QByteArray root;

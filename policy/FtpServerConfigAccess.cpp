@@ -31,10 +31,8 @@ bool FtpServerConfig::checkAccess(const QByteArray &user, bool repair, AccessFai
         std::unique_ptr<PassCache> &pass;
         ~Restore()
         {
-            if (pass) {
-                *pass = PassCache();
-                config.m_pass = std::move(pass);
-            }
+            if (pass)
+                config.m_pass = std::make_unique<PassCache>();
         }
     } restore{*this, pass};
     for (const Check check : checks) {

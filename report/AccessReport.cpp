@@ -8,8 +8,10 @@
 #include <QJsonObject>
 
 #include <algorithm>
+#include <exception>
 #include <functional>
 #include <iostream>
+#include <thread>
 #include <vector>
 
 void ReportInteraction::show(const Message &message)
@@ -59,15 +61,49 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
     LoginForecast forecast(config);
     report.serverFindings = forecast.serverFindings();
     report.serverFails = forecast.serverFails();
+
+    std::vector<std::pair<QByteArray, QString>> users;
+    users.reserve(config.accounts().accounts().size() + config.accounts().virtualUsers().size() + 1);
+    for (const auto &entry : config.accounts().accounts())
+        users.emplace_back(entry.first, QStringLiteral("local"));
+    for (const auto &entry : config.accounts().virtualUsers())
+        users.emplace_back(entry.first, QStringLiteral("virtual"));
+    users.emplace_back(AppStrings::instance().anonymousUsers.toLocal8Bit(), QStringLiteral("anonymous"));
+
+    // The forecasts only read what was loaded (and the pass's file
+    // metadata, which is locked), so they are made on a second thread
+    // while the verdicts, which may ask and keep caches of their own, are
+    // made here.
+    std::vector<UserForecast> forecasts(users.size());
+    std::exception_ptr forecastError;
+    std::thread worker([&] {
+        try {
+            for (size_t i = 0; i < users.size(); ++i)
+                forecasts[i] = forecast.userForecast(users[i].first);
+        } catch (...) {
+            forecastError = std::current_exception();
+        }
+    });
+    struct Join
+    {
+        std::thread &thread;
+        // Also when a verdict throws (the report's exit).
+        ~Join()
+        {
+            if (thread.joinable())
+                thread.join();
+        }
+    } join{worker};
+
     QList<ReportRow> &rows = report.rows;
-    const auto evaluate = [&](const QByteArray &name, const QString &kind) {
+    rows.reserve(static_cast<int>(users.size()));
+    for (const auto &[name, kind] : users) {
         ReportRow row;
         row.name = name;
         row.kind = kind;
         row.allowed = config.checkAccess(name, false, &row.failure);
         row.directory = config.effectiveRoot(name);
         row.rights = rightsText(config.userRights(name));
-        row.forecast = forecast.userForecast(name);
         if (!row.allowed && row.failure.message.isEmpty() && interaction.pamProblems > 0) {
             // The PAM check refuses without a message of its own when the
             // PAM file does not start its stacks with pam_userdb.so; it asks
@@ -75,13 +111,13 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
             row.failure.message = QStringLiteral("PAM configuration problem: the first auth or account line of the "
                                                  "PAM file is not \"sufficient pam_userdb.so\"");
         }
-        rows.append(row);
-    };
-    for (const auto &entry : config.accounts().accounts())
-        evaluate(entry.first, QStringLiteral("local"));
-    for (const auto &entry : config.accounts().virtualUsers())
-        evaluate(entry.first, QStringLiteral("virtual"));
-    evaluate(AppStrings::instance().anonymousUsers.toLocal8Bit(), QStringLiteral("anonymous"));
+        rows.append(std::move(row));
+    }
+    worker.join();
+    if (forecastError)
+        std::rethrow_exception(forecastError);
+    for (int i = 0; i < rows.size(); ++i)
+        rows[i].forecast = std::move(forecasts[static_cast<size_t>(i)]);
     return report;
 }
 
