@@ -205,15 +205,17 @@ public:
     QByteArray value(const QByteArray &key, const QByteArray &defaultValue = {}) const;
     // Lower-cased value compared with "yes"; absent gives the default.
     bool isYes(const QByteArray &key, bool absentMeansYes = false) const;
-    // Keys written in the code, looked up without a copy on the heap: the
-    // checks ask for several of them for every user.
+    // Keys written in the code, looked up by the literal's address within a
+    // pass, with nothing made on the heap: the checks ask for several of
+    // them for every user.
     template <size_t N> QByteArray value(const char (&key)[N], const QByteArray &defaultValue = {}) const
     {
-        return value(QByteArray::fromRawData(key, N - 1), defaultValue);
+        return literalValue(key, N - 1).value_or(defaultValue);
     }
     template <size_t N> bool isYes(const char (&key)[N], bool absentMeansYes = false) const
     {
-        return isYes(QByteArray::fromRawData(key, N - 1), absentMeansYes);
+        const std::optional<QByteArray> found = literalValue(key, N - 1);
+        return found ? found->compare("yes", Qt::CaseInsensitive) == 0 : absentMeansYes;
     }
 
     ConfigFile &mainConfig();
@@ -265,6 +267,11 @@ private:
     QString resolved(const QByteArray &path) const;
     // The main configuration's value of a key; empty when it is absent.
     std::optional<QByteArray> mainValue(const QByteArray &key) const;
+    template <size_t N> std::optional<QByteArray> mainValue(const char (&key)[N]) const
+    {
+        return literalValue(key, N - 1);
+    }
+    std::optional<QByteArray> literalValue(const char *key, int size) const;
     bool ensureDirectoryOf(const QString &path);
     bool fixPamUserdb();
     void remember(const QString &key, const ConfigFile &document);
@@ -326,12 +333,17 @@ private:
         // several times, and the set of 100,000 names is slow to reach.
         QByteArray virtualQuery;
         bool virtualAnswer = false;
+        // The configured root of the guests without a file or token of
+        // their own.
+        std::optional<QByteArray> sharedGuestRoot;
         // The last user's effective root.
         QByteArray rootUser;
         QByteArray root;
         // What the PAM file says of every virtual user, with its refusal.
         std::optional<std::pair<bool, AccessFailure>> pamUserdb;
         QHash<QByteArray, std::optional<QByteArray>> values;
+        // The same by the address of a key written in the code.
+        std::vector<std::pair<const char *, std::optional<QByteArray>>> literals;
     };
     mutable std::unique_ptr<PassCache> m_pass;
     // How each document printed when it was loaded: a save leaves a file

@@ -47,7 +47,7 @@ bool FtpServerConfig::checkMainConfig(const QByteArray &user, bool repair, Acces
     if (isAnonymousUser(user)) {
         const auto anonymous = mainValue("anonymous_enable");
         // The server's own default admits anonymous users.
-        if (!anonymous || anonymous->toLower() == "yes")
+        if (!anonymous || anonymous->compare("yes", Qt::CaseInsensitive) == 0)
             return true;
         if (repair) {
             findData(m_main.elements, "", "anonymous_enable")->value = "yes";
@@ -58,7 +58,7 @@ bool FtpServerConfig::checkMainConfig(const QByteArray &user, bool repair, Acces
     }
 
     const auto local = mainValue("local_enable");
-    if (local && local->toLower() != "yes") {
+    if (local && local->compare("yes", Qt::CaseInsensitive) != 0) {
         if (!repair)
             return refuse(failure, FailureKind::MainConfig, refusal("main ftp config has local_enable != yes"));
         findData(m_main.elements, "", "local_enable")->value = "yes";
@@ -255,28 +255,28 @@ bool FtpServerConfig::checkFtpusers(const QByteArray &user, bool repair, AccessF
 
 bool FtpServerConfig::checkUserlist(const QByteArray &user, bool repair, AccessFailure *failure)
 {
-    const QString name = text(user);
+    const auto name = [&user] { return text(user); };
     switch (userlistMode()) {
     case UserlistMode::Off:
         return true;
     case UserlistMode::Deny:
-        if (!m_userlist.contains(name))
+        if (!m_userlist.contains(user))
             return true;
         if (!repair) {
             return refuse(failure, FailureKind::UserlistFile,
-                          refusal("userlist file contains %1, userlist file mode = black users").arg(name));
+                          refusal("userlist file contains %1, userlist file mode = black users").arg(name()));
         }
-        m_userlist.removeAll(name);
+        m_userlist.removeAll(name());
         m_userlistModified = m_modified = true;
         return true;
     case UserlistMode::Allow:
-        if (m_userlist.contains(name))
+        if (m_userlist.contains(user))
             return true;
         if (!repair) {
             return refuse(failure, FailureKind::UserlistFile,
-                          refusal("userlist file doesn't contains %1, userlist file mode = white users").arg(name));
+                          refusal("userlist file doesn't contains %1, userlist file mode = white users").arg(name()));
         }
-        m_userlist.append(name);
+        m_userlist.append(name());
         m_userlistModified = m_modified = true;
         return true;
     }

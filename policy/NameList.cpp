@@ -2,8 +2,10 @@
 
 NameList::NameList(const QStringList &names)
     : m_names(names)
-    , m_index(names.begin(), names.end())
 {
+    m_index.reserve(names.size());
+    for (const QString &name : names)
+        m_index.insert(name.toUtf8());
 }
 
 const QStringList &NameList::names() const
@@ -12,6 +14,11 @@ const QStringList &NameList::names() const
 }
 
 bool NameList::contains(const QString &name) const
+{
+    return m_index.contains(name.toUtf8());
+}
+
+bool NameList::contains(const QByteArray &name) const
 {
     return m_index.contains(name);
 }
@@ -29,12 +36,12 @@ int NameList::size() const
 void NameList::append(const QString &name)
 {
     m_names.append(name);
-    m_index.insert(name);
+    m_index.insert(name.toUtf8());
 }
 
 int NameList::removeAll(const QString &name)
 {
-    m_index.remove(name);
+    m_index.remove(name.toUtf8());
     return m_names.removeAll(name);
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <QByteArray>
 #include <QSet>
 #include <QString>
 #include <QStringList>
@@ -15,6 +16,9 @@ public:
 
     const QStringList &names() const;
     bool contains(const QString &name) const;
+    // The same for a name as the accounts hold it (UTF-8), with nothing
+    // converted: the table asks this for every user.
+    bool contains(const QByteArray &name) const;
     bool isEmpty() const;
     int size() const;
 
@@ -27,5 +31,5 @@ public:
 
 private:
     QStringList m_names;
-    QSet<QString> m_index;
+    QSet<QByteArray> m_index; // UTF-8
 };
