@@ -8,6 +8,7 @@
 #include <QJsonObject>
 
 #include <algorithm>
+#include <atomic>
 #include <exception>
 #include <functional>
 #include <iostream>
@@ -73,28 +74,27 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
     // The forecasts only read what was loaded (and the pass's file
     // metadata, which is locked), so they are made on a second thread
     // while the verdicts, which may ask and keep caches of their own, are
-    // made here.
+    // made here; then this thread helps with the forecasts left, with a
+    // forecast of its own (their caches are not shared), taking users in
+    // chunks from the same counter.
     std::vector<UserForecast> forecasts(users.size());
+    std::atomic<size_t> next{0};
+    constexpr size_t Chunk = 256;
+    const auto forecastRest = [&](LoginForecast &by) {
+        for (size_t first = next.fetch_add(Chunk); first < users.size(); first = next.fetch_add(Chunk)) {
+            const size_t end = std::min(first + Chunk, users.size());
+            for (size_t i = first; i < end; ++i)
+                forecasts[i] = by.userForecast(users[i].first);
+        }
+    };
     std::exception_ptr forecastError;
     std::thread worker([&] {
         try {
-            for (size_t i = 0; i < users.size(); ++i)
-                forecasts[i] = forecast.userForecast(users[i].first);
+            forecastRest(forecast);
         } catch (...) {
             forecastError = std::current_exception();
         }
     });
-    struct Join
-    {
-        std::thread &thread;
-        // Also when a verdict throws (the report's exit).
-        ~Join()
-        {
-            if (thread.joinable())
-                thread.join();
-        }
-    } join{worker};
-
     QList<ReportRow> &rows = report.rows;
     rows.reserve(static_cast<int>(users.size()));
     for (const auto &[name, kind] : users) {
@@ -112,6 +112,10 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
                                                  "PAM file is not \"sufficient pam_userdb.so\"");
         }
         rows.append(std::move(row));
+    }
+    if (next.load() < users.size()) {
+        LoginForecast helper(config);
+        forecastRest(helper);
     }
     worker.join();
     if (forecastError)
