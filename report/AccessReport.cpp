@@ -95,6 +95,18 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
             forecastError = std::current_exception();
         }
     });
+    // Joined also when a verdict throws (the report's exit), so that the
+    // thread is never left running.
+    struct Join
+    {
+        std::thread &thread;
+        ~Join()
+        {
+            if (thread.joinable())
+                thread.join();
+        }
+    } join{worker};
+
     QList<ReportRow> &rows = report.rows;
     rows.reserve(static_cast<int>(users.size()));
     for (const auto &[name, kind] : users) {
