@@ -198,7 +198,19 @@ QList<QByteArray> AccountStore::userGroups(const QByteArray &name) const
 
 bool AccountStore::isUserInGroup(const QByteArray &name, const QByteArray &groupName) const
 {
-    return userGroups(name).contains(groupName);
+    // Asked for every user's root: answered without a list of the groups.
+    const auto supplementary = m_supplementaryGroups.constFind(name);
+    if (supplementary != m_supplementaryGroups.constEnd() && supplementary->contains(groupName))
+        return true;
+    const AccountRecord *account = m_passwdIndex.value(name);
+    if (!account)
+        return false;
+    const auto primary = m_groups.find(account->gid);
+    if (primary == m_groups.end()) {
+        std::cerr << "Warning: user has gid=" << account->gid << ", but such group could not be found" << std::endl;
+        return false;
+    }
+    return primary->second.name == groupName;
 }
 
 int AccountStore::groupIdByName(const QByteArray &groupName) const
