@@ -6,6 +6,34 @@
 
 #include <QFile>
 
+#include <atomic>
+
+namespace {
+
+// What this thread has looked up by path in a pass: the forecast's thread
+// and the verdicts' would otherwise queue on the pass's lock for every
+// user's home. Tied to the pass by its number, never by its address, which
+// a later pass may reuse.
+struct ThreadPaths
+{
+    quint64 pass = 0;
+    QHash<QByteArray, std::optional<struct stat>> paths;
+};
+thread_local ThreadPaths threadPaths;
+
+quint64 nextPassNumber()
+{
+    static std::atomic<quint64> last{0};
+    return ++last;
+}
+
+} // namespace
+
+FtpServerConfig::PassCache::PassCache()
+    : number(nextPassNumber())
+{
+}
+
 FtpServerConfig::FtpServerConfig(Interaction &interaction, const RootDirectory &root, Mode mode)
     : m_interaction(interaction)
     , m_root(root)
@@ -25,8 +53,11 @@ FtpServerConfig::MetadataPass::MetadataPass(FtpServerConfig &config)
 
 FtpServerConfig::MetadataPass::~MetadataPass()
 {
-    if (m_outer)
-        m_config.m_pass.reset();
+    if (!m_outer)
+        return;
+    if (threadPaths.pass == m_config.m_pass->number)
+        threadPaths = ThreadPaths();
+    m_config.m_pass.reset();
 }
 
 std::optional<struct stat> FtpServerConfig::fileStatus(const QString &resolvedPath) const
@@ -70,16 +101,12 @@ std::optional<struct stat> FtpServerConfig::pathStatus(const QByteArray &path) c
 {
     if (!m_pass)
         return fileStatus(resolved(path));
-    {
-        const std::lock_guard<std::mutex> lock(m_pass->statusLock);
-        const auto it = m_pass->paths.constFind(path);
-        if (it != m_pass->paths.constEnd())
-            return *it;
-    }
-    const auto status = fileStatus(resolved(path));
-    const std::lock_guard<std::mutex> lock(m_pass->statusLock);
-    m_pass->paths.insert(path, status);
-    return status;
+    if (threadPaths.pass != m_pass->number)
+        threadPaths = ThreadPaths{m_pass->number, {}};
+    auto it = threadPaths.paths.constFind(path);
+    if (it == threadPaths.paths.constEnd())
+        it = threadPaths.paths.insert(path, fileStatus(resolved(path)));
+    return *it;
 }
 
 std::optional<QByteArray> FtpServerConfig::mainValue(const QByteArray &key) const

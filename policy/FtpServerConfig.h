@@ -324,11 +324,13 @@ private:
     // values by key. None when no pass is open.
     struct PassCache
     {
+        PassCache();
+        const quint64 number; // no two passes of the process share one
         // The file metadata is shared with a forecast that may run on
         // another thread during the pass; the rest is the verdict's own.
+        // Each thread also keeps what it looked up by path as written.
         std::mutex statusLock;
         QHash<QString, std::optional<struct stat>> metadata;
-        QHash<QByteArray, std::optional<struct stat>> paths;
         // Whether the last user asked about is a virtual one: a check asks
         // several times, and the set of 100,000 names is slow to reach.
         QByteArray virtualQuery;
