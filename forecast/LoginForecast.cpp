@@ -401,29 +401,33 @@ const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
     // never for a name with a "/".
     if (!m_settings.contains("user_config_dir") || login.contains('/'))
         return nullptr;
-    auto it = m_userFiles.find(login);
-    if (it == m_userFiles.end()) {
+    const auto userFileDirectory = [this] {
         QByteArray directory = m_settings.value("user_config_dir");
         if (!directory.endsWith('/'))
             directory += '/';
-        // Most users have no file: the directory is listed once, and only
-        // the names it holds are opened (a name with a "/" goes below it).
-        if (!m_userFileNamesRead) {
-            m_userFileNamesRead = true;
-            m_userFileNames.emplace();
-            const QByteArray onDisk = QFile::encodeName(m_config.root().resolve(text(directory)));
-            if (DIR *listed = ::opendir(onDisk.constData())) {
-                while (const dirent *entry = ::readdir(listed))
-                    m_userFileNames->insert(QByteArray(entry->d_name));
-                ::closedir(listed);
-            } else {
-                m_userFileNames.reset();
-            }
+        return directory;
+    };
+    // Most users have no file: the directory is listed once, and only the
+    // names it holds are opened (a name with a "/" goes below it).
+    if (!m_userFileNamesRead) {
+        m_userFileNamesRead = true;
+        m_userFileNames.emplace();
+        const QByteArray onDisk = QFile::encodeName(m_config.root().resolve(text(userFileDirectory())));
+        if (DIR *listed = ::opendir(onDisk.constData())) {
+            while (const dirent *entry = ::readdir(listed))
+                m_userFileNames->insert(QByteArray(entry->d_name));
+            ::closedir(listed);
+        } else {
+            m_userFileNames.reset();
         }
-        // A directory that cannot be listed is tried name by name; a name it
-        // does not hold has no file, and nothing to remember.
-        if (m_userFileNames && !m_userFileNames->contains(login))
-            return nullptr;
+    }
+    // A directory that cannot be listed is tried name by name; a name it
+    // does not hold has no file, and nothing to remember.
+    if (m_userFileNames && !m_userFileNames->contains(login))
+        return nullptr;
+    auto it = m_userFiles.find(login);
+    if (it == m_userFiles.end()) {
+        const QByteArray directory = userFileDirectory();
         std::unique_ptr<VsftpdSettings> settings;
         const QString path = m_config.root().resolve(text(directory + login));
         struct stat info;

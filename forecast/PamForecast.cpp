@@ -273,6 +273,11 @@ QList<PamForecast::Line> PamForecast::stack(const QByteArray &facility)
                     = parseAction(line.actions.value(CodeNames[code], line.actions.value("default", "bad")));
                 line.parsedActions[static_cast<size_t>(code)] = {static_cast<int>(action.action), action.jump};
             }
+            if (line.module == "pam_userdb.so") {
+                line.userdb = argument(line.args, "db");
+                // pam_userdb always appends ".db": "db=/x/users.db" opens /x/users.db.db.
+                line.userdbFile = line.userdb + ".db";
+            }
         }
         it = m_stacks.emplace(facility, lines).first;
     }
@@ -481,9 +486,8 @@ const QHash<QByteArray, int> *PamForecast::listEntries(const QByteArray &file)
     return it->second ? &*it->second : nullptr;
 }
 
-const QSet<QByteArray> *PamForecast::userdbKeys(const QByteArray &db)
+const QSet<QByteArray> *PamForecast::userdbKeys(const QByteArray &db, const QByteArray &file)
 {
-    const QByteArray file = db + ".db";
     // The database the account store has read, untouched since, is the one
     // pam_userdb would open: its names are not read a second time.
     const VirtualUserDb *stored = m_accounts.database();
@@ -511,12 +515,11 @@ const QSet<QByteArray> *PamForecast::userdbKeys(const QByteArray &db)
 
 PamForecast::ModuleAnswer PamForecast::runUserdb(const Line &line, const QByteArray &user)
 {
-    const QByteArray db = argument(line.args, "db");
+    const QByteArray &db = line.userdb;
     if (db.isEmpty())
         return {ServiceErr, QStringLiteral("pam_userdb has no db= argument")};
-    // pam_userdb always appends ".db": "db=/x/users.db" opens /x/users.db.db.
-    const QByteArray file = db + ".db";
-    const QSet<QByteArray> *keys = userdbKeys(db);
+    const QByteArray &file = line.userdbFile;
+    const QSet<QByteArray> *keys = userdbKeys(db, file);
     if (!keys) {
         return {AuthinfoUnavail,
                 QStringLiteral("pam_userdb cannot open %1 (db=%2 with \".db\" appended)")

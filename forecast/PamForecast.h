@@ -70,7 +70,7 @@ public:
     bool sessionMakesHome();
     // The names in the database file pam_userdb opens for the argument
     // db= (its value with ".db"), read once; null when it cannot be opened.
-    const QSet<QByteArray> *userdbKeys(const QByteArray &db);
+    const QSet<QByteArray> *userdbKeys(const QByteArray &db, const QByteArray &file);
 
     // Codes a module answers with, by their names in "[value=action]".
     enum Code {
@@ -98,6 +98,9 @@ private:
         // The action each code leads to (its kind and the jump of "N"),
         // parsed once when the stack is built rather than for every user.
         std::array<std::pair<int, int>, CodeCount> parsedActions{};
+        // pam_userdb's db= and the file it opens, db= with ".db" appended.
+        QByteArray userdb;
+        QByteArray userdbFile;
         QString file;
         int line = 0;
         // Not empty for a line Linux-PAM could not load: it fails as
