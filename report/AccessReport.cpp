@@ -151,7 +151,47 @@ QJsonArray findingsJson(const QList<ForecastFinding> &findings)
     return array;
 }
 
-// Hands the table on in pieces of about a megabyte, like the JSON.
+// Runs here and beside on another thread, both to their end, whatever
+// either throws; then the first exception goes on.
+void onTwoThreads(const std::function<void()> &here, const std::function<void()> &beside)
+{
+    std::exception_ptr besideError;
+    std::thread thread([&] {
+        try {
+            beside();
+        } catch (...) {
+            besideError = std::current_exception();
+        }
+    });
+    try {
+        here();
+    } catch (...) {
+        thread.join();
+        throw;
+    }
+    thread.join();
+    if (besideError)
+        std::rethrow_exception(besideError);
+}
+
+// Makes the text of rows [0, count) two blocks at a time, one on each
+// thread, and hands the blocks on in order: the whole text would be as
+// large again as the rows it comes from.
+void formatInBlocks(int count, const std::function<void(int, int, QByteArray &)> &format,
+                    const std::function<void(const QByteArray &)> &write)
+{
+    constexpr int Block = 4096;
+    for (int first = 0; first < count; first += 2 * Block) {
+        const int middle = std::min(first + Block, count);
+        const int end = std::min(middle + Block, count);
+        QByteArray out;
+        QByteArray after;
+        onTwoThreads([&] { format(first, middle, out); }, [&] { format(middle, end, after); });
+        write(out);
+        write(after);
+    }
+}
+
 void writeText(const Report &report, const std::function<void(const QByteArray &)> &write)
 {
     const QList<ReportRow> &rows = report.rows;
@@ -168,52 +208,64 @@ void writeText(const Report &report, const std::function<void(const QByteArray &
         }
     }
     // The cells of every line first, since their widths make the columns;
-    // then each line is padded in one reused buffer.
+    // then the lines. Each half of the rows on a thread of its own.
     const int columns = header.size();
-    std::vector<QString> cells(header.begin(), header.end());
-    cells.reserve(static_cast<size_t>((rows.size() + 1) * columns));
+    const size_t width = static_cast<size_t>(columns);
+    std::vector<QString> cells(static_cast<size_t>(rows.size() + 1) * width);
+    std::copy(header.begin(), header.end(), cells.begin());
     const AppStrings &strings = AppStrings::instance();
     const QString none = QStringLiteral("-");
-    for (const ReportRow &row : rows) {
-        const bool failed = !row.failure.message.isEmpty();
-        cells.push_back(QString::fromUtf8(row.name));
-        cells.push_back(row.kind);
-        cells.push_back(row.allowed ? strings.allowed : strings.denied);
-        cells.push_back(forecastStatusText(row.forecast.status));
-        cells.push_back(QString::fromUtf8(row.directory));
-        cells.push_back(row.rights.isEmpty() ? none : row.rights);
-        cells.push_back(failed ? failureKindText(row.failure.kind) : none);
-        cells.push_back(failed ? row.failure.message : none);
-        cells.push_back(row.forecast.findings.isEmpty() ? serverSays : findingText(row.forecast.findings.first()));
-    }
-    QVector<int> widths(columns, 0);
-    for (size_t i = 0; i < cells.size(); ++i) {
-        int &width = widths[static_cast<int>(i % static_cast<size_t>(columns))];
-        width = std::max(width, static_cast<int>(cells[i].size()));
-    }
+    const auto makeCells = [&](int first, int end, QVector<int> &widths) {
+        widths.fill(0, columns);
+        for (int r = first; r < end; ++r) {
+            const ReportRow &row = rows[r];
+            const bool failed = !row.failure.message.isEmpty();
+            QString *cell = &cells[static_cast<size_t>(r + 1) * width];
+            cell[0] = QString::fromUtf8(row.name);
+            cell[1] = row.kind;
+            cell[2] = row.allowed ? strings.allowed : strings.denied;
+            cell[3] = forecastStatusText(row.forecast.status);
+            cell[4] = QString::fromUtf8(row.directory);
+            cell[5] = row.rights.isEmpty() ? none : row.rights;
+            cell[6] = failed ? failureKindText(row.failure.kind) : none;
+            cell[7] = failed ? row.failure.message : none;
+            cell[8] = row.forecast.findings.isEmpty() ? serverSays : findingText(row.forecast.findings.first());
+            for (int i = 0; i < columns; ++i)
+                widths[i] = std::max(widths[i], static_cast<int>(cell[i].size()));
+        }
+    };
+    const int middle = rows.size() / 2;
+    QVector<int> widths;
+    QVector<int> laterWidths;
+    onTwoThreads([&] { makeCells(0, middle, widths); }, [&] { makeCells(middle, rows.size(), laterWidths); });
+    for (int i = 0; i < columns; ++i)
+        widths[i] = std::max({widths[i], laterWidths[i], static_cast<int>(header[i].size())});
+
     QByteArray out;
     for (const ForecastFinding &finding : report.serverFindings) {
         out += QStringLiteral("server %1: %2\n").arg(severityText(finding.severity), findingText(finding)).toUtf8();
     }
     if (!report.serverFindings.isEmpty())
         out += '\n';
-    QString line;
-    for (size_t first = 0; first < cells.size(); first += static_cast<size_t>(columns)) {
-        line.clear();
-        for (int i = 0; i < columns; ++i) {
-            const QString &cell = cells[first + static_cast<size_t>(i)];
-            line += cell;
-            if (i + 1 < columns && cell.size() < widths[i] + 2)
-                line.resize(line.size() + widths[i] + 2 - cell.size(), QLatin1Char(' '));
-        }
-        out += QStringView(line).trimmed().toUtf8();
-        out += '\n';
-        if (out.size() > (1 << 20)) {
-            write(out);
-            out.clear();
-        }
-    }
     write(out);
+    // Line 0 is the header.
+    formatInBlocks(
+        rows.size() + 1,
+        [&](int first, int end, QByteArray &text) {
+            QString line;
+            for (int l = first; l < end; ++l) {
+                line.clear();
+                for (int i = 0; i < columns; ++i) {
+                    const QString &cell = cells[static_cast<size_t>(l) * width + static_cast<size_t>(i)];
+                    line += cell;
+                    if (i + 1 < columns && cell.size() < widths[i] + 2)
+                        line.resize(line.size() + widths[i] + 2 - cell.size(), QLatin1Char(' '));
+                }
+                text += QStringView(line).trimmed().toUtf8();
+                text += '\n';
+            }
+        },
+        write);
 }
 
 } // namespace
@@ -280,8 +332,6 @@ void appendFindings(QByteArray &out, const QList<ForecastFinding> &findings)
 
 namespace {
 
-// Hands the text on in pieces of about a megabyte: the whole of it would
-// be as large again as the rows it comes from.
 void writeJson(const Report &report, const QString &root, const std::function<void(const QByteArray &)> &write)
 {
     // The document is printed without its users, and the users one by one
@@ -296,37 +346,39 @@ void writeJson(const Report &report, const QString &root, const std::function<vo
     const QByteArray framed = QJsonDocument(frame).toJson(QJsonDocument::Indented);
     const int placeholder = framed.lastIndexOf("        0\n");
     QByteArray out = framed.left(placeholder);
+    write(out);
     const AppStrings &strings = AppStrings::instance();
-    for (int i = 0; i < report.rows.size(); ++i) {
-        const ReportRow &row = report.rows[i];
-        const bool failed = !row.failure.message.isEmpty();
-        out += "        {\n            \"directory\": ";
-        appendJsonString(out, QString::fromUtf8(row.directory));
-        out += ",\n            \"failureKind\": ";
-        out += QByteArray::number(failed ? static_cast<int>(row.failure.kind) : 0);
-        out += ",\n            \"failureText\": ";
-        appendJsonString(out, failed ? failureKindText(row.failure.kind) : QString());
-        out += ",\n            \"forecast\": {\n                \"findings\": ";
-        appendFindings(out, row.forecast.findings);
-        out += ",\n                \"status\": ";
-        appendJsonString(out, forecastStatusText(row.forecast.status));
-        out += "\n            },\n            \"kind\": ";
-        appendJsonString(out, row.kind);
-        out += ",\n            \"message\": ";
-        appendJsonString(out, row.failure.message);
-        out += ",\n            \"name\": ";
-        appendJsonString(out, QString::fromUtf8(row.name));
-        out += ",\n            \"rights\": ";
-        appendJsonString(out, row.rights);
-        out += ",\n            \"status\": ";
-        appendJsonString(out, row.allowed ? strings.allowed : strings.denied);
-        out += i + 1 < report.rows.size() ? "\n        },\n" : "\n        }\n";
-        if (out.size() > (1 << 20)) {
-            write(out);
-            out.clear();
-        }
-    }
-    write(out + framed.mid(placeholder + 10));
+    formatInBlocks(
+        report.rows.size(),
+        [&](int first, int end, QByteArray &text) {
+            for (int i = first; i < end; ++i) {
+                const ReportRow &row = report.rows[i];
+                const bool failed = !row.failure.message.isEmpty();
+                text += "        {\n            \"directory\": ";
+                appendJsonString(text, QString::fromUtf8(row.directory));
+                text += ",\n            \"failureKind\": ";
+                text += QByteArray::number(failed ? static_cast<int>(row.failure.kind) : 0);
+                text += ",\n            \"failureText\": ";
+                appendJsonString(text, failed ? failureKindText(row.failure.kind) : QString());
+                text += ",\n            \"forecast\": {\n                \"findings\": ";
+                appendFindings(text, row.forecast.findings);
+                text += ",\n                \"status\": ";
+                appendJsonString(text, forecastStatusText(row.forecast.status));
+                text += "\n            },\n            \"kind\": ";
+                appendJsonString(text, row.kind);
+                text += ",\n            \"message\": ";
+                appendJsonString(text, row.failure.message);
+                text += ",\n            \"name\": ";
+                appendJsonString(text, QString::fromUtf8(row.name));
+                text += ",\n            \"rights\": ";
+                appendJsonString(text, row.rights);
+                text += ",\n            \"status\": ";
+                appendJsonString(text, row.allowed ? strings.allowed : strings.denied);
+                text += i + 1 < report.rows.size() ? "\n        },\n" : "\n        }\n";
+            }
+        },
+        write);
+    write(framed.mid(placeholder + 10));
 }
 
 } // namespace

@@ -72,6 +72,7 @@ private slots:
     void runs_data();
     void runs();
     void table();
+    void manyRows();
     void serverFindingsOnce_data();
     void serverFindingsOnce();
     void hostileFiles_data();
@@ -164,6 +165,47 @@ void TestReport::table()
     }
     // One line per account, the anonymous row, the header and the final newline.
     QCOMPARE(lines.size(), 8 + 1 + 1 + 1);
+}
+
+void TestReport::manyRows()
+{
+    // More rows than the writers make at a time on each thread, and an odd
+    // number: every row once, in the table's order, in both outputs.
+    FixtureRoot root;
+    QVERIFY(root.write({{QStringLiteral("/etc/vsftpd.conf"), "local_enable=YES\nguest_enable=YES\n"},
+                        {QStringLiteral("/etc/pam.d/vsftpd"),
+                         "auth sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
+                         "account sufficient pam_userdb.so db=/etc/vsftpd/virtual\n"
+                         "@include common-auth\n"}}));
+    QMap<QByteArray, QByteArray> virtualUsers;
+    for (int i = 0; i < 9001; ++i)
+        virtualUsers.insert("v" + QByteArray::number(i), "secret");
+    QVERIFY(root.writeVirtualUsers(QStringLiteral("/etc/vsftpd/virtual.db"), virtualUsers));
+
+    const ProcessResult json = report({QStringLiteral("--root"), root.path(), QStringLiteral("--json")});
+    QCOMPARE(json.exitCode, 0);
+    QJsonParseError error{};
+    const QJsonArray users
+        = QJsonDocument::fromJson(json.out, &error).object().value(QStringLiteral("users")).toArray();
+    QCOMPARE(error.error, QJsonParseError::NoError);
+    QStringList names;
+    for (const QJsonValue &user : users)
+        names << user.toObject().value(QStringLiteral("name")).toString();
+    const int locals = names.indexOf(QStringLiteral("v0"));
+    QVERIFY(locals > 0);
+    QStringList expected = names.mid(0, locals);
+    for (const QByteArray &name : virtualUsers.keys())
+        expected << QString::fromUtf8(name);
+    expected << QStringLiteral("Anonymous users");
+    QCOMPARE(names, expected);
+
+    const ProcessResult text = report({QStringLiteral("--root"), root.path()});
+    QCOMPARE(text.exitCode, 0);
+    QList<QByteArray> lines = text.out.mid(text.out.indexOf("USER ")).split('\n');
+    QCOMPARE(lines.takeLast(), QByteArray());
+    QCOMPARE(lines.size(), expected.size() + 1);
+    for (int i = 0; i < expected.size(); ++i)
+        QVERIFY2(lines[i + 1].startsWith(expected[i].toUtf8() + ' '), lines[i + 1].constData());
 }
 
 void TestReport::serverFindingsOnce_data()
