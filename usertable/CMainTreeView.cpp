@@ -16,10 +16,18 @@ void CMainTreeView::currentChanged(const QModelIndex &current, const QModelIndex
     emit selected(current);
 }
 
-void CMainTreeView::expandGroups(const QModelIndex &parent)
+void CMainTreeView::expandGroups()
 {
+    expandGroups(QModelIndex(), 0);
+}
+
+void CMainTreeView::expandGroups(const QModelIndex &parent, int depth)
+{
+    // Groups are the table's top two levels: the users below them hold no
+    // rows, and asking 110,000 of them whether they do costs a filter
+    // toggle more than the expanding itself.
     const QAbstractItemModel *rows = model();
-    if (!rows)
+    if (!rows || depth >= 2)
         return;
     const int count = rows->rowCount(parent);
     for (int row = 0; row < count; ++row) {
@@ -28,6 +36,6 @@ void CMainTreeView::expandGroups(const QModelIndex &parent)
             continue;
         if (!isExpanded(index))
             expand(index);
-        expandGroups(index);
+        expandGroups(index, depth + 1);
     }
 }

@@ -14,11 +14,14 @@ public:
     // Every row that has rows below it expanded: what expandAll() shows
     // here, where only groups hold rows, without laying out every user row
     // again when the groups are open already (a filter toggle).
-    void expandGroups(const QModelIndex &parent = QModelIndex());
+    void expandGroups();
 
 signals:
     void selected(const QModelIndex &index);
 
 protected:
     void currentChanged(const QModelIndex &current, const QModelIndex &previous) override;
+
+private:
+    void expandGroups(const QModelIndex &parent, int depth);
 };
