@@ -162,12 +162,15 @@ uint32_t AccountStore::firstUserId() const
 
 bool AccountStore::isSystemUser(const QByteArray &name) const
 {
-    AccountRecord record;
-    if (!getUserInfo(name, record))
-        return false;
-    if (record.uid < firstUserId())
+    const AccountRecord *account = m_passwdIndex.value(name);
+    return account && isSystemAccount(*account);
+}
+
+bool AccountStore::isSystemAccount(const AccountRecord &account) const
+{
+    if (account.uid < firstUserId())
         return true;
-    const QByteArray shell = record.shell.mid(record.shell.lastIndexOf('/') + 1);
+    const QByteArray shell = account.shell.mid(account.shell.lastIndexOf('/') + 1);
     return shell == "nologin" || shell == "false";
 }
 

@@ -54,6 +54,8 @@ public:
     // As Debian decides it: an id below UID_MIN of login.defs, or a shell
     // that cannot log in. Names that are no account are not system users.
     bool isSystemUser(const QByteArray &name) const;
+    // The same of an account at hand.
+    bool isSystemAccount(const AccountRecord &account) const;
     // Supplementary groups in gid order, then the primary group.
     QList<QByteArray> userGroups(const QByteArray &name) const;
     bool isUserInGroup(const QByteArray &name, const QByteArray &groupName) const;

@@ -127,7 +127,7 @@ void CMainWindow::build()
 
     m_view = new CMainTreeView(this);
     setCentralWidget(m_view);
-    m_proxy = new CUsersFilterProxyModel(&m_model->config(), this);
+    m_proxy = new CUsersFilterProxyModel(this);
     m_proxy->setSourceModel(m_model);
     m_view->setModel(m_proxy);
     m_loginCheckDock->setModel(m_model);

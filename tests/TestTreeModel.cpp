@@ -251,14 +251,20 @@ private slots:
         QTest::addColumn<bool>("denied");
         QTest::addColumn<bool>("allowed");
         QTest::addColumn<QStringList>("local");
+        QTest::addColumn<QStringList>("virtuals");
 
-        QTest::newRow("nothing hidden") << false << false << false << localUsers;
+        // The virtual "root" shares a system account's name. Without
+        // guest_enable every virtual user is denied.
+        const QStringList virtuals = strings("root", "vic", "wendy");
+        QTest::newRow("nothing hidden") << false << false << false << localUsers << virtuals;
         QTest::newRow("system users") << true << false << false
-                                      << strings("alice", "bob", "doublebang", "locked", "lockedhash", "starred");
+                                      << strings("alice", "bob", "doublebang", "locked", "lockedhash", "starred")
+                                      << strings("vic", "wendy");
         QTest::newRow("denied") << false << true << false
-                                << strings("alice", "bob", "doublebang", "ftp", "lockedhash", "nobody");
-        QTest::newRow("allowed") << false << false << true << strings("locked", "root", "starred");
-        QTest::newRow("allowed and denied") << false << true << true << QStringList();
+                                << strings("alice", "bob", "doublebang", "ftp", "lockedhash", "nobody")
+                                << QStringList();
+        QTest::newRow("allowed") << false << false << true << strings("locked", "root", "starred") << virtuals;
+        QTest::newRow("allowed and denied") << false << true << true << QStringList() << QStringList();
     }
 
     void filters()
@@ -267,10 +273,14 @@ private slots:
         QFETCH(bool, denied);
         QFETCH(bool, allowed);
         QFETCH(QStringList, local);
+        QFETCH(QStringList, virtuals);
 
         Table table;
         QVERIFY(table.load());
-        CUsersFilterProxyModel proxy(&table.model->config());
+        QVERIFY(table.root.writeVirtualUsers(QStringLiteral("/var/lib/ftpconfig/vsftpd_virtual_users.db"),
+                                             {{"vic", "v"}, {"wendy", "w"}, {"root", "r"}}));
+        QVERIFY(table.reload());
+        CUsersFilterProxyModel proxy;
         QAbstractItemModelTester tester(&proxy, QAbstractItemModelTester::FailureReportingMode::QtTest);
         proxy.setSourceModel(table.model.get());
         proxy.setHideSystemUsers(system);
@@ -280,6 +290,7 @@ private slots:
         // Group rows are never hidden.
         QCOMPARE(childNames(proxy, everybody).mid(0, 2), (strings("Local users", "Virtual users")));
         QCOMPARE(childNames(proxy, proxy.index(0, 0, everybody)), local);
+        QCOMPARE(childNames(proxy, proxy.index(1, 0, everybody)), virtuals);
     }
 };
 

@@ -1,12 +1,9 @@
 #include "CUsersFilterProxyModel.h"
 
-#include "accounts/AccountStore.h"
-#include "common/AppStrings.h"
-#include "policy/FtpServerConfig.h"
+#include "TreeModel.h"
 
-CUsersFilterProxyModel::CUsersFilterProxyModel(FtpServerConfig *config, QObject *parent)
+CUsersFilterProxyModel::CUsersFilterProxyModel(QObject *parent)
     : QSortFilterProxyModel(parent)
-    , m_config(config)
 {
 }
 
@@ -49,23 +46,11 @@ bool CUsersFilterProxyModel::filterAcceptsRow(int sourceRow, const QModelIndex &
     // just to be shown: the table of a large system opens at once.
     if (!m_hideSystem && !m_hideDenied && !m_hideAllowed)
         return true;
-    const QAbstractItemModel *source = sourceModel();
-    const QModelIndex nameIndex = source->index(sourceRow, 0, sourceParent);
-    const QModelIndex statusIndex = source->index(sourceRow, 1, sourceParent);
-    const auto status = [&] { return source->data(statusIndex).toString(); };
-    // Group rows have no status and always stay.
-    if (m_hideSystem && m_config && m_config->accounts().isSystemUser(source->data(nameIndex).toString().toUtf8())
-        && !status().isEmpty())
-        return false;
-    if (!m_hideDenied && !m_hideAllowed)
+    const QVariant flags = sourceModel()->index(sourceRow, 0, sourceParent).data(TreeModel::FilterRole);
+    // Group rows have none and always stay.
+    if (!flags.isValid())
         return true;
-    const QString text = status();
-    if (text.isEmpty())
-        return true;
-    const AppStrings &strings = AppStrings::instance();
-    if (m_hideAllowed && text == strings.allowed)
+    if (m_hideSystem && (flags.toInt() & TreeModel::SystemUser))
         return false;
-    if (m_hideDenied)
-        return text != strings.denied;
-    return true;
+    return (flags.toInt() & TreeModel::AllowedUser) ? !m_hideAllowed : !m_hideDenied;
 }

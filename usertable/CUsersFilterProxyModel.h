@@ -2,15 +2,13 @@
 
 #include <QSortFilterProxyModel>
 
-class FtpServerConfig;
-
 // Hides system, denied or allowed users on request; group rows stay.
 class CUsersFilterProxyModel : public QSortFilterProxyModel
 {
     Q_OBJECT
 
 public:
-    CUsersFilterProxyModel(FtpServerConfig *config, QObject *parent = nullptr);
+    explicit CUsersFilterProxyModel(QObject *parent = nullptr);
 
     void setHideSystemUsers(bool hide);
     void setHideDeniedUsers(bool hide);
@@ -23,7 +21,6 @@ protected:
     bool filterAcceptsRow(int sourceRow, const QModelIndex &sourceParent) const override;
 
 private:
-    FtpServerConfig *m_config;
     bool m_hideSystem = false;
     bool m_hideDenied = false;
     bool m_hideAllowed = false;

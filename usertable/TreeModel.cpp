@@ -1,5 +1,6 @@
 #include "TreeModel.h"
 
+#include "accounts/AccountStore.h"
 #include "common/AppStrings.h"
 #include "common/RootDirectory.h"
 #include "common/SafeFile.h"
@@ -35,6 +36,8 @@ struct TreeModel::Item
     QString directory;
     QString mode;
     std::optional<UserForecast> forecast;
+    // Whether a system account has the name, for the filter.
+    std::optional<bool> system;
 
     Item *append(std::unique_ptr<Item> child)
     {
@@ -83,11 +86,22 @@ void TreeModel::buildRows()
     m_localUsers = everybody->append(makeItem(Item::Kind::Group, {}, strings.localUsers));
     m_virtualUsers = everybody->append(makeItem(Item::Kind::Group, {}, strings.virtualUsers));
     everybody->append(makeItem(Item::Kind::Anonymous, strings.anonymousUsers.toLocal8Bit(), strings.anonymousUsers));
-    for (const auto &entry : m_config->accounts().accounts())
-        m_localUsers->append(makeItem(Item::Kind::User, entry.first, QString::fromUtf8(entry.first)));
+    // Which rows name a system account, for the filter that hides them:
+    // read off each account here, and for a virtual user from the few
+    // system names instead of a search of every account.
+    const AccountStore &accounts = m_config->accounts();
+    QSet<QByteArray> systemNames;
+    for (const auto &[name, account] : accounts.accounts()) {
+        Item *item = m_localUsers->append(makeItem(Item::Kind::User, name, QString::fromUtf8(name)));
+        item->system = accounts.isSystemAccount(account);
+        if (*item->system)
+            systemNames.insert(name);
+    }
     const QList<QByteArray> virtualNames = m_config->virtualUserNames();
-    for (const QByteArray &name : virtualNames)
-        m_virtualUsers->append(makeItem(Item::Kind::User, name, QString::fromUtf8(name)));
+    for (const QByteArray &name : virtualNames) {
+        Item *item = m_virtualUsers->append(makeItem(Item::Kind::User, name, QString::fromUtf8(name)));
+        item->system = systemNames.contains(name);
+    }
     m_forecast.reset();
     // The PAM check may ask the operator: ask now, with nothing painted yet,
     // rather than from inside a paint when the first virtual row is shown.
@@ -123,7 +137,7 @@ void TreeModel::evaluateAll()
 void TreeModel::evaluatePending(qint64 milliseconds)
 {
     // Files and settings read once for all the users of the slice.
-    const FtpServerConfig::MetadataPass pass(*m_config);
+    FtpServerConfig::MetadataPass pass(*m_config);
     QElapsedTimer slice;
     slice.start();
     const Item *groups[] = {m_localUsers, m_virtualUsers};
@@ -134,7 +148,10 @@ void TreeModel::evaluatePending(qint64 milliseconds)
             m_pendingRow = 0;
             continue;
         }
-        compute(*children[m_pendingRow++]);
+        Item &item = *children[m_pendingRow++];
+        if (m_pendingGroup == 1 && !item.computed)
+            pass.knownVirtualUser(item.name);
+        compute(item);
         if (milliseconds >= 0 && (m_pendingRow & 63) == 0 && slice.elapsed() >= milliseconds)
             return;
     }
@@ -228,6 +245,14 @@ QVariant TreeModel::data(const QModelIndex &index, int role) const
         compute(item);
     const int column = index.column();
 
+    if (role == FilterRole) {
+        // Asked of every row at each toggle of a filter: no text is made.
+        if (!user)
+            return {};
+        if (!item.system)
+            item.system = m_config->accounts().isSystemUser(item.name);
+        return (*item.system ? SystemUser : 0) | (item.allowed ? AllowedUser : 0);
+    }
     if (role == Qt::DisplayRole || role == Qt::EditRole) {
         switch (column) {
         case UsersColumn:

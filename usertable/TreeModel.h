@@ -33,7 +33,10 @@ public:
         FailureKindRole = Qt::UserRole + 1,
         // The forecast status (ForecastStatus as int) of a user row.
         ForecastRole,
+        // What the filters ask of a user row, as FilterFlags; none for a group.
+        FilterRole,
     };
+    enum FilterFlag { SystemUser = 1, AllowedUser = 2 };
 
     // The titles of the columns; the engine is loaded from the root
     // directory of the environment through the interaction.
