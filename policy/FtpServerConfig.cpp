@@ -60,6 +60,12 @@ FtpServerConfig::MetadataPass::~MetadataPass()
     m_config.m_pass.reset();
 }
 
+void FtpServerConfig::MetadataPass::knownVirtualUser(const QByteArray &user)
+{
+    m_config.m_pass->virtualQuery = user;
+    m_config.m_pass->virtualAnswer = true;
+}
+
 std::optional<struct stat> FtpServerConfig::fileStatus(const QString &resolvedPath) const
 {
     const auto read = [&]() -> std::optional<struct stat>

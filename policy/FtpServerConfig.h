@@ -73,6 +73,9 @@ public:
         ~MetadataPass();
         MetadataPass(const MetadataPass &) = delete;
         MetadataPass &operator=(const MetadataPass &) = delete;
+        // The caller took the user from the virtual users' names: the
+        // checks that follow do not search the 100,000 names for it again.
+        void knownVirtualUser(const QByteArray &user);
 
     private:
         FtpServerConfig &m_config;

@@ -58,7 +58,7 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
     Report report;
     // Every user's checks and forecast see the same guest root, lists and
     // database: their metadata is read once.
-    const FtpServerConfig::MetadataPass pass(config);
+    FtpServerConfig::MetadataPass pass(config);
     LoginForecast forecast(config);
     report.serverFindings = forecast.serverFindings();
     report.serverFails = forecast.serverFails();
@@ -67,8 +67,9 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
     users.reserve(config.accounts().accounts().size() + config.accounts().virtualUsers().size() + 1);
     for (const auto &entry : config.accounts().accounts())
         users.emplace_back(entry.first, QStringLiteral("local"));
+    const QString virtualKind = QStringLiteral("virtual");
     for (const auto &entry : config.accounts().virtualUsers())
-        users.emplace_back(entry.first, QStringLiteral("virtual"));
+        users.emplace_back(entry.first, virtualKind);
     users.emplace_back(AppStrings::instance().anonymousUsers.toLocal8Bit(), QStringLiteral("anonymous"));
 
     // The forecasts only read what was loaded (and the pass's file
@@ -113,6 +114,8 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
         ReportRow row;
         row.name = name;
         row.kind = kind;
+        if (kind == virtualKind)
+            pass.knownVirtualUser(name);
         row.allowed = config.checkAccess(name, false, &row.failure);
         row.directory = config.effectiveRoot(name);
         row.rights = rightsText(config.userRights(name));
