@@ -1,6 +1,7 @@
 #include "AccountStore.h"
 
 #include "common/AppStrings.h"
+#include "common/Parallel.h"
 
 #include <QFile>
 
@@ -253,15 +254,28 @@ void AccountStore::loadVirtualUsers(const QByteArray &path)
     m_virtualUsers.clear();
     m_virtualNames.clear();
     m_virtualUsersChanged = false;
-    auto records = m_db->readAll();
+    const auto records = m_db->readAll();
     // The hash file gives its keys in no order: sorted first, each goes in
-    // at the end of the map instead of by a walk down the tree.
-    std::sort(records.begin(), records.end(), [](const auto &a, const auto &b) { return a.first < b.first; });
-    m_virtualNames.reserve(static_cast<int>(records.size()));
-    for (auto &[name, password] : records) {
-        m_virtualUsers.emplace_hint(m_virtualUsers.end(), name,
-                                    VirtualUserRecord{password, {}, VirtualUserState::Unchanged});
-        m_virtualNames.insert(name);
+    // at the end of the map instead of by a walk down the tree. The halves
+    // are sorted on two threads, the second also filling the set of names;
+    // the records themselves never move while both read them.
+    using Record = std::pair<QByteArray, QByteArray>;
+    std::vector<const Record *> order(records.size());
+    for (size_t i = 0; i < records.size(); ++i)
+        order[i] = &records[i];
+    const auto byName = [](const Record *a, const Record *b) { return a->first < b->first; };
+    const auto middle = order.begin() + static_cast<std::ptrdiff_t>(order.size() / 2);
+    onTwoThreads([&] { std::sort(order.begin(), middle, byName); },
+                 [&] {
+                     std::sort(middle, order.end(), byName);
+                     m_virtualNames.reserve(static_cast<int>(records.size()));
+                     for (const Record &record : records)
+                         m_virtualNames.insert(record.first);
+                 });
+    std::inplace_merge(order.begin(), middle, order.end(), byName);
+    for (const Record *record : order) {
+        m_virtualUsers.emplace_hint(m_virtualUsers.end(), record->first,
+                                    VirtualUserRecord{record->second, {}, VirtualUserState::Unchanged});
     }
 }
 

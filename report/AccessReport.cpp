@@ -1,6 +1,7 @@
 #include "AccessReport.h"
 
 #include "common/AppStrings.h"
+#include "common/Parallel.h"
 #include "policy/FtpServerConfig.h"
 
 #include <QJsonArray>
@@ -152,29 +153,6 @@ QJsonArray findingsJson(const QList<ForecastFinding> &findings)
                                  {QStringLiteral("message"), finding.message}});
     }
     return array;
-}
-
-// Runs here and beside on another thread, both to their end, whatever
-// either throws; then the first exception goes on.
-void onTwoThreads(const std::function<void()> &here, const std::function<void()> &beside)
-{
-    std::exception_ptr besideError;
-    std::thread thread([&] {
-        try {
-            beside();
-        } catch (...) {
-            besideError = std::current_exception();
-        }
-    });
-    try {
-        here();
-    } catch (...) {
-        thread.join();
-        throw;
-    }
-    thread.join();
-    if (besideError)
-        std::rethrow_exception(besideError);
 }
 
 // Makes the text of rows [0, count) two blocks at a time, one on each
