@@ -507,6 +507,11 @@ UserForecast LoginForecast::forecast(const QByteArray &user)
     return result;
 }
 
+void LoginForecast::knownVirtualUser(const QByteArray &user)
+{
+    m_pam->knownVirtualUser(user);
+}
+
 UserForecast LoginForecast::userForecast(const QByteArray &user)
 {
     if (m_serverFails)

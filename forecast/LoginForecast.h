@@ -57,6 +57,9 @@ public:
     // The same without the server-wide findings, for a listing that gives
     // them once for all users: a failing server leaves none of the user's.
     UserForecast userForecast(const QByteArray &user);
+    // The caller took the user from the account store's virtual users: the
+    // forecast that follows does not search their names for it again.
+    void knownVirtualUser(const QByteArray &user);
 
 private:
     UserForecast forecastAnonymous();

@@ -525,9 +525,16 @@ PamForecast::ModuleAnswer PamForecast::runUserdb(const Line &line, const QByteAr
                 QStringLiteral("pam_userdb cannot open %1 (db=%2 with \".db\" appended)")
                     .arg(QString::fromUtf8(file), QString::fromUtf8(db))};
     }
-    if (!keys->contains(user))
+    const bool known
+        = keys == &m_accounts.virtualUserKeys() && !m_knownVirtualUser.isNull() && user == m_knownVirtualUser;
+    if (!known && !keys->contains(user))
         return {UserUnknown, QStringLiteral("%1 is not in %2").arg(QString::fromUtf8(user), QString::fromUtf8(file))};
     return {Success, QString()};
+}
+
+void PamForecast::knownVirtualUser(const QByteArray &user)
+{
+    m_knownVirtualUser = user;
 }
 
 PamForecast::ModuleAnswer PamForecast::run(const Line &line, const QByteArray &user)

@@ -69,8 +69,12 @@ public:
     // A session stack that holds pam_mkhomedir makes a missing home.
     bool sessionMakesHome();
     // The names in the database file pam_userdb opens for the argument
-    // db= (its value with ".db"), read once; null when it cannot be opened.
+    // db=, file (its value with ".db"), read once; null when it cannot be
+    // opened.
     const QSet<QByteArray> *userdbKeys(const QByteArray &db, const QByteArray &file);
+    // The user is one of the account store's virtual users, so one of the
+    // names of its database: the names are not searched for it.
+    void knownVirtualUser(const QByteArray &user);
 
     // Codes a module answers with, by their names in "[value=action]".
     enum Code {
@@ -169,5 +173,6 @@ private:
     // Lists and databases are read once per forecast, not once per user.
     std::map<QByteArray, std::optional<QHash<QByteArray, int>>> m_lists;
     std::map<QByteArray, std::optional<QSet<QByteArray>>> m_userdbs;
+    QByteArray m_knownVirtualUser;
     std::optional<QHash<QByteArray, QList<QByteArray>>> m_shadow;
 };

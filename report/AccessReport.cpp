@@ -85,8 +85,11 @@ Report buildReport(FtpServerConfig &config, ReportInteraction &interaction)
     const auto forecastRest = [&](LoginForecast &by) {
         for (size_t first = next.fetch_add(Chunk); first < users.size(); first = next.fetch_add(Chunk)) {
             const size_t end = std::min(first + Chunk, users.size());
-            for (size_t i = first; i < end; ++i)
+            for (size_t i = first; i < end; ++i) {
+                if (users[i].second == virtualKind)
+                    by.knownVirtualUser(users[i].first);
                 forecasts[i] = by.userForecast(users[i].first);
+            }
         }
     };
     std::exception_ptr forecastError;
