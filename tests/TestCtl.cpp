@@ -90,188 +90,185 @@ class TestCtl : public QObject
     Q_OBJECT
 
 private slots:
-    void commands_data();
-    void commands();
-    void refusals_data();
-    void refusals();
-    void listAndGet();
+    void commands_data()
+    {
+        QTest::addColumn<QStringList>("arguments");
+        QTest::addColumn<QByteArray>("input");
+        // A line each changed file must hold afterwards, by path.
+        QTest::addColumn<FileMap>("lines");
+        QTest::addColumn<QByteArray>("planLine"); // of the dry run, for the database
+        QTest::addColumn<Passwords>("virtualUsers");
+
+        const Passwords vic{{"vic", "secret"}};
+        const QString conf = QStringLiteral("/etc/vsftpd.conf");
+        const QString userlist = QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf");
+        QTest::newRow("allow") << QStringList{QStringLiteral("allow"), QStringLiteral("bob")} << QByteArray()
+                               << FileMap{{userlist, "alice\nbob\n"}, {conf, "userlist_enable=yes\n"}} << QByteArray()
+                               << vic;
+        // The allowed list becomes a list of the denied: asked, and emptied.
+        QTest::newRow("deny") << QStringList{QStringLiteral("--yes"), QStringLiteral("deny"), QStringLiteral("bob")}
+                              << QByteArray() << FileMap{{userlist, "bob\n"}, {conf, "userlist_deny=yes\n"}}
+                              << QByteArray() << vic;
+        QTest::newRow("root") << QStringList{QStringLiteral("--yes"), QStringLiteral("root"), QStringLiteral("bob"),
+                                             QStringLiteral("/srv/bob")}
+                              << QByteArray()
+                              << FileMap{{QStringLiteral("/etc/vsftpd.d/users.d/bob"), "local_root=/srv/bob\n"},
+                                         {QStringLiteral("/etc/vsftpd.chroot_list"), "bob\n"}}
+                              << QByteArray() << vic;
+        QTest::newRow("rights") << QStringList{QStringLiteral("rights"), QStringLiteral("bob"),
+                                               QStringLiteral("write,download")}
+                                << QByteArray()
+                                << FileMap{{QStringLiteral("/etc/vsftpd.d/users.d/bob"), "anon_upload_enable=no\n"}}
+                                << QByteArray() << vic;
+        QTest::newRow("set") << QStringList{QStringLiteral("set"), QStringLiteral("ftpd_banner"), QStringLiteral("Hi")}
+                             << QByteArray() << FileMap{{conf, "ftpd_banner=Hi\n"}} << QByteArray() << vic;
+        QTest::newRow("unset") << QStringList{QStringLiteral("unset"), QStringLiteral("chroot_local_user")}
+                               << QByteArray() << FileMap{{conf, "local_enable=YES\n"}} << QByteArray() << vic;
+        QTest::newRow("vuser add") << QStringList{QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve")}
+                                   << QByteArray("pw eve\n") << FileMap()
+                                   << QByteArray("virtual user added to /etc/vsftpd/virtual.db: eve\n")
+                                   << Passwords{{"vic", "secret"}, {"eve", "pw eve"}};
+        QTest::newRow("vuser passwd") << QStringList{QStringLiteral("vuser"), QStringLiteral("passwd"),
+                                                     QStringLiteral("vic")}
+                                      << QByteArray("new\n") << FileMap()
+                                      << QByteArray("virtual user changed in /etc/vsftpd/virtual.db: vic (password)\n")
+                                      << Passwords{{"vic", "new"}};
+        QTest::newRow("vuser del") << QStringList{QStringLiteral("vuser"), QStringLiteral("del"), QStringLiteral("vic")}
+                                   << QByteArray() << FileMap()
+                                   << QByteArray("virtual user removed from /etc/vsftpd/virtual.db: vic\n")
+                                   << Passwords();
+    }
+
+    // Each command twice on the same root: a dry run writes nothing, and its
+    // diff, applied with patch to the files as they were, gives byte for byte
+    // what the real run then writes; the real run keeps each file it replaces.
+    void commands()
+    {
+        QFETCH(QStringList, arguments);
+        QFETCH(QByteArray, input);
+        QFETCH(FileMap, lines);
+        QFETCH(QByteArray, planLine);
+        QFETCH(Passwords, virtualUsers);
+
+        CtlRoot root;
+        const FileMap before = root.files();
+        const auto dry = root.run(QStringList{QStringLiteral("--dry-run")} + arguments, input);
+        QVERIFY2(dry.finished && dry.exitCode == 0, dry.err.constData());
+        QCOMPARE(root.files(), before);
+        QVERIFY2(planLine.isEmpty() == !dry.out.contains("virtual user"), dry.out.constData());
+        QVERIFY2(dry.out.startsWith(planLine), dry.out.constData());
+        QVERIFY(!dry.out.contains("secret") && (input.isEmpty() || !dry.out.contains(input.trimmed())));
+
+        const auto real = root.run(arguments, input);
+        QVERIFY2(real.finished && real.exitCode == 0, real.err.constData());
+        const FileMap after = root.files();
+        QCOMPARE(root.virtualUsers(), virtualUsers);
+
+        QString why;
+        const FileMap patched = textFiles(patchedFiles(before, dry.out, why));
+        QVERIFY2(why.isEmpty(), qPrintable(why));
+        FileMap written = textFiles(after);
+        for (const QString &path : backupsOf(after))
+            written.remove(path + QLatin1String(Backup));
+        for (const QString &path : patched.keys() + written.keys())
+            QVERIFY2(patched.value(path, "<none>") == written.value(path, "<none>"),
+                     qPrintable(path + QStringLiteral(":\n") + QString::fromUtf8(patched.value(path, "<none>"))
+                                + QStringLiteral("\nwritten:\n") + QString::fromUtf8(written.value(path, "<none>"))));
+
+        for (auto it = lines.begin(); it != lines.end(); ++it)
+            QVERIFY2(after.value(it.key()).contains(*it),
+                     qPrintable(it.key() + QLatin1Char('\n') + QString::fromUtf8(after.value(it.key()))));
+        // Every file replaced, the database included, is kept as it was with
+        // its mode; a file that did not exist is kept as nothing.
+        QStringList replaced;
+        for (auto it = before.begin(); it != before.end(); ++it) {
+            if (after.value(it.key()) != *it)
+                replaced << it.key();
+        }
+        QCOMPARE(backupsOf(after), replaced);
+        for (const QString &path : replaced) {
+            QCOMPARE(after.value(path + QLatin1String(Backup)), before.value(path));
+            const int mode = path.endsWith(QLatin1String(".db")) ? 0600 : modeOf(root.filePath(path));
+            QCOMPARE(modeOf(root.filePath(path + QLatin1String(Backup))), mode);
+        }
+        QVERIFY(!replaced.isEmpty());
+    }
+
+    void refusals_data()
+    {
+        QTest::addColumn<QStringList>("arguments");
+        QTest::addColumn<QByteArray>("input");
+        QTest::addColumn<int>("status");
+        QTest::addColumn<QByteArray>("message");
+
+        const auto row
+            = [](const char *name, const QStringList &arguments, const QByteArray &input, int status,
+                 const QByteArray &message) { QTest::newRow(name) << arguments << input << status << message; };
+        row("question without --yes", {QStringLiteral("root"), QStringLiteral("bob"), QStringLiteral("/srv/bob")}, {},
+            2, "a question needs an answer (run with --yes to accept its repair):\nThis user is not chroot'ed");
+        row("password argument",
+            {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve"), QStringLiteral("pw")}, "pw\n", 2,
+            "a password is read from standard input, never from the command line");
+        row("password option", {QStringLiteral("--password=pw"), QStringLiteral("vuser"), QStringLiteral("add")}, {}, 2,
+            "a password is read from standard input, never from the command line");
+        row("no password", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve")}, {}, 1,
+            "no password on standard input");
+        row("bad name", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral(".eve")}, "pw\n", 1,
+            "\".eve\" cannot be a user name: the name begins with \".\".");
+        row("name of an account", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("bob")}, "pw\n", 1,
+            "A user named bob exists already.");
+        row("virtual user twice", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("vic")}, "pw\n", 1,
+            "User vic allready exists in users database.");
+        row("no such virtual user", {QStringLiteral("vuser"), QStringLiteral("del"), QStringLiteral("bob")}, {}, 1,
+            "Unable to find information about virtual user bob in database.");
+        row("unknown key", {QStringLiteral("set"), QStringLiteral("no_such_key"), QStringLiteral("yes")}, {}, 1,
+            "unknown setting \"no_such_key\": vsftpd stops (unrecognised variable in config file)");
+        row("bad bool", {QStringLiteral("set"), QStringLiteral("listen"), QStringLiteral("maybe")}, {}, 1,
+            "listen=\"maybe\" is not a yes/no value");
+        row("bad number", {QStringLiteral("set"), QStringLiteral("listen_port"), QStringLiteral("21a")}, {}, 1,
+            "listen_port=\"21a\" is not a number");
+        row("unknown user", {QStringLiteral("allow"), QStringLiteral("ghost")}, {}, 1, "no user named ghost");
+        row("refused allow", {QStringLiteral("allow"), QStringLiteral("locked")}, {}, 1,
+            "Unable to change access status.\n***Result: FALSE. Check: user locked  has bad passwd");
+        row("unknown right", {QStringLiteral("rights"), QStringLiteral("bob"), QStringLiteral("write, fly")}, {}, 1,
+            "\"fly\" is no right");
+        row("relative root", {QStringLiteral("root"), QStringLiteral("bob"), QStringLiteral("srv")}, {}, 1,
+            "The directory must be an absolute path.");
+        row("unknown command", {QStringLiteral("frobnicate")}, {}, 2, "unknown command: frobnicate");
+        row("missing argument", {QStringLiteral("set"), QStringLiteral("listen")}, {}, 2, "set takes 2 argument(s)");
+    }
+
+    void refusals()
+    {
+        QFETCH(QStringList, arguments);
+        QFETCH(QByteArray, input);
+        QFETCH(int, status);
+        QFETCH(QByteArray, message);
+
+        CtlRoot root;
+        const FileMap before = root.files();
+        const auto result = root.run(arguments, input);
+        QVERIFY(result.finished);
+        QCOMPARE(result.exitCode, status);
+        QVERIFY2(result.err.contains("ftpconfig-ctl: " + message), result.err.constData());
+        QCOMPARE(root.files(), before);
+    }
+
+    void listAndGet()
+    {
+        CtlRoot root;
+        const auto list = root.run({QStringLiteral("list")});
+        const auto json = root.run({QStringLiteral("list"), QStringLiteral("--json")});
+        const auto get = root.run({QStringLiteral("get"), QStringLiteral("local_enable")});
+        const auto unset = root.run({QStringLiteral("get"), QStringLiteral("ftpd_banner")});
+        QCOMPARE(get.exitCode, 0);
+        QCOMPARE(get.out, QByteArray("YES\n"));
+        QCOMPARE(unset.exitCode, 1);
+        QVERIFY(list.exitCode == 0 && list.out.contains("vic") && list.out.contains("bob"));
+        QVERIFY(json.exitCode == 0 && json.out.startsWith('{') && json.out.contains("\"vic\""));
+    }
 };
 
-void TestCtl::commands_data()
-{
-    QTest::addColumn<QStringList>("arguments");
-    QTest::addColumn<QByteArray>("input");
-    // A line each changed file must hold afterwards, by path.
-    QTest::addColumn<FileMap>("lines");
-    QTest::addColumn<QByteArray>("planLine"); // of the dry run, for the database
-    QTest::addColumn<Passwords>("virtualUsers");
-
-    const Passwords vic{{"vic", "secret"}};
-    const QString conf = QStringLiteral("/etc/vsftpd.conf");
-    const QString userlist = QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf");
-    QTest::newRow("allow") << QStringList{QStringLiteral("allow"), QStringLiteral("bob")} << QByteArray()
-                           << FileMap{{userlist, "alice\nbob\n"}, {conf, "userlist_enable=yes\n"}} << QByteArray()
-                           << vic;
-    // The allowed list becomes a list of the denied: asked, and emptied.
-    QTest::newRow("deny") << QStringList{QStringLiteral("--yes"), QStringLiteral("deny"), QStringLiteral("bob")}
-                          << QByteArray() << FileMap{{userlist, "bob\n"}, {conf, "userlist_deny=yes\n"}} << QByteArray()
-                          << vic;
-    QTest::newRow("root") << QStringList{QStringLiteral("--yes"), QStringLiteral("root"), QStringLiteral("bob"),
-                                         QStringLiteral("/srv/bob")}
-                          << QByteArray()
-                          << FileMap{{QStringLiteral("/etc/vsftpd.d/users.d/bob"), "local_root=/srv/bob\n"},
-                                     {QStringLiteral("/etc/vsftpd.chroot_list"), "bob\n"}}
-                          << QByteArray() << vic;
-    QTest::newRow("rights") << QStringList{QStringLiteral("rights"), QStringLiteral("bob"),
-                                           QStringLiteral("write,download")}
-                            << QByteArray()
-                            << FileMap{{QStringLiteral("/etc/vsftpd.d/users.d/bob"), "anon_upload_enable=no\n"}}
-                            << QByteArray() << vic;
-    QTest::newRow("set") << QStringList{QStringLiteral("set"), QStringLiteral("ftpd_banner"), QStringLiteral("Hi")}
-                         << QByteArray() << FileMap{{conf, "ftpd_banner=Hi\n"}} << QByteArray() << vic;
-    QTest::newRow("unset") << QStringList{QStringLiteral("unset"), QStringLiteral("chroot_local_user")} << QByteArray()
-                           << FileMap{{conf, "local_enable=YES\n"}} << QByteArray() << vic;
-    QTest::newRow("vuser add") << QStringList{QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve")}
-                               << QByteArray("pw eve\n") << FileMap()
-                               << QByteArray("virtual user added to /etc/vsftpd/virtual.db: eve\n")
-                               << Passwords{{"vic", "secret"}, {"eve", "pw eve"}};
-    QTest::newRow("vuser passwd") << QStringList{QStringLiteral("vuser"), QStringLiteral("passwd"),
-                                                 QStringLiteral("vic")}
-                                  << QByteArray("new\n") << FileMap()
-                                  << QByteArray("virtual user changed in /etc/vsftpd/virtual.db: vic (password)\n")
-                                  << Passwords{{"vic", "new"}};
-    QTest::newRow("vuser del") << QStringList{QStringLiteral("vuser"), QStringLiteral("del"), QStringLiteral("vic")}
-                               << QByteArray() << FileMap()
-                               << QByteArray("virtual user removed from /etc/vsftpd/virtual.db: vic\n") << Passwords();
-}
-
-// Each command twice on the same root: a dry run writes nothing, and its
-// diff, applied with patch to the files as they were, gives byte for byte
-// what the real run then writes; the real run keeps each file it replaces.
-void TestCtl::commands()
-{
-    QFETCH(QStringList, arguments);
-    QFETCH(QByteArray, input);
-    QFETCH(FileMap, lines);
-    QFETCH(QByteArray, planLine);
-    QFETCH(Passwords, virtualUsers);
-
-    CtlRoot root;
-    const FileMap before = root.files();
-    const auto dry = root.run(QStringList{QStringLiteral("--dry-run")} + arguments, input);
-    QVERIFY2(dry.finished && dry.exitCode == 0, dry.err.constData());
-    QCOMPARE(root.files(), before);
-    QVERIFY2(planLine.isEmpty() == !dry.out.contains("virtual user"), dry.out.constData());
-    QVERIFY2(dry.out.startsWith(planLine), dry.out.constData());
-    QVERIFY(!dry.out.contains("secret") && (input.isEmpty() || !dry.out.contains(input.trimmed())));
-
-    const auto real = root.run(arguments, input);
-    QVERIFY2(real.finished && real.exitCode == 0, real.err.constData());
-    const FileMap after = root.files();
-    QCOMPARE(root.virtualUsers(), virtualUsers);
-
-    QString why;
-    const FileMap patched = textFiles(patchedFiles(before, dry.out, why));
-    QVERIFY2(why.isEmpty(), qPrintable(why));
-    FileMap written = textFiles(after);
-    for (const QString &path : backupsOf(after))
-        written.remove(path + QLatin1String(Backup));
-    for (const QString &path : patched.keys() + written.keys())
-        QVERIFY2(patched.value(path, "<none>") == written.value(path, "<none>"),
-                 qPrintable(path + QStringLiteral(":\n") + QString::fromUtf8(patched.value(path, "<none>"))
-                            + QStringLiteral("\nwritten:\n") + QString::fromUtf8(written.value(path, "<none>"))));
-
-    for (auto it = lines.begin(); it != lines.end(); ++it)
-        QVERIFY2(after.value(it.key()).contains(*it),
-                 qPrintable(it.key() + QLatin1Char('\n') + QString::fromUtf8(after.value(it.key()))));
-    // Every file replaced, the database included, is kept as it was with
-    // its mode; a file that did not exist is kept as nothing.
-    QStringList replaced;
-    for (auto it = before.begin(); it != before.end(); ++it) {
-        if (after.value(it.key()) != *it)
-            replaced << it.key();
-    }
-    QCOMPARE(backupsOf(after), replaced);
-    for (const QString &path : replaced) {
-        QCOMPARE(after.value(path + QLatin1String(Backup)), before.value(path));
-        const int mode = path.endsWith(QLatin1String(".db")) ? 0600 : modeOf(root.filePath(path));
-        QCOMPARE(modeOf(root.filePath(path + QLatin1String(Backup))), mode);
-    }
-    QVERIFY(!replaced.isEmpty());
-}
-
-void TestCtl::refusals_data()
-{
-    QTest::addColumn<QStringList>("arguments");
-    QTest::addColumn<QByteArray>("input");
-    QTest::addColumn<int>("status");
-    QTest::addColumn<QByteArray>("message");
-
-    const auto row = [](const char *name, const QStringList &arguments, const QByteArray &input, int status,
-                        const QByteArray &message) { QTest::newRow(name) << arguments << input << status << message; };
-    row("question without --yes", {QStringLiteral("root"), QStringLiteral("bob"), QStringLiteral("/srv/bob")}, {}, 2,
-        "a question needs an answer (run with --yes to accept its repair):\nThis user is not chroot'ed");
-    row("password argument",
-        {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve"), QStringLiteral("pw")}, "pw\n", 2,
-        "a password is read from standard input, never from the command line");
-    row("password option", {QStringLiteral("--password=pw"), QStringLiteral("vuser"), QStringLiteral("add")}, {}, 2,
-        "a password is read from standard input, never from the command line");
-    row("no password", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve")}, {}, 1,
-        "no password on standard input");
-    row("bad name", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral(".eve")}, "pw\n", 1,
-        "\".eve\" cannot be a user name: the name begins with \".\".");
-    row("name of an account", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("bob")}, "pw\n", 1,
-        "A user named bob exists already.");
-    row("virtual user twice", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("vic")}, "pw\n", 1,
-        "User vic allready exists in users database.");
-    row("no such virtual user", {QStringLiteral("vuser"), QStringLiteral("del"), QStringLiteral("bob")}, {}, 1,
-        "Unable to find information about virtual user bob in database.");
-    row("unknown key", {QStringLiteral("set"), QStringLiteral("no_such_key"), QStringLiteral("yes")}, {}, 1,
-        "unknown setting \"no_such_key\": vsftpd stops (unrecognised variable in config file)");
-    row("bad bool", {QStringLiteral("set"), QStringLiteral("listen"), QStringLiteral("maybe")}, {}, 1,
-        "listen=\"maybe\" is not a yes/no value");
-    row("bad number", {QStringLiteral("set"), QStringLiteral("listen_port"), QStringLiteral("21a")}, {}, 1,
-        "listen_port=\"21a\" is not a number");
-    row("unknown user", {QStringLiteral("allow"), QStringLiteral("ghost")}, {}, 1, "no user named ghost");
-    row("refused allow", {QStringLiteral("allow"), QStringLiteral("locked")}, {}, 1,
-        "Unable to change access status.\n***Result: FALSE. Check: user locked  has bad passwd");
-    row("unknown right", {QStringLiteral("rights"), QStringLiteral("bob"), QStringLiteral("write, fly")}, {}, 1,
-        "\"fly\" is no right");
-    row("relative root", {QStringLiteral("root"), QStringLiteral("bob"), QStringLiteral("srv")}, {}, 1,
-        "The directory must be an absolute path.");
-    row("unknown command", {QStringLiteral("frobnicate")}, {}, 2, "unknown command: frobnicate");
-    row("missing argument", {QStringLiteral("set"), QStringLiteral("listen")}, {}, 2, "set takes 2 argument(s)");
-}
-
-void TestCtl::refusals()
-{
-    QFETCH(QStringList, arguments);
-    QFETCH(QByteArray, input);
-    QFETCH(int, status);
-    QFETCH(QByteArray, message);
-
-    CtlRoot root;
-    const FileMap before = root.files();
-    const auto result = root.run(arguments, input);
-    QVERIFY(result.finished);
-    QCOMPARE(result.exitCode, status);
-    QVERIFY2(result.err.contains("ftpconfig-ctl: " + message), result.err.constData());
-    QCOMPARE(root.files(), before);
-}
-
-void TestCtl::listAndGet()
-{
-    CtlRoot root;
-    const auto list = root.run({QStringLiteral("list")});
-    const auto json = root.run({QStringLiteral("list"), QStringLiteral("--json")});
-    const auto get = root.run({QStringLiteral("get"), QStringLiteral("local_enable")});
-    const auto unset = root.run({QStringLiteral("get"), QStringLiteral("ftpd_banner")});
-    QCOMPARE(get.exitCode, 0);
-    QCOMPARE(get.out, QByteArray("YES\n"));
-    QCOMPARE(unset.exitCode, 1);
-    QVERIFY(list.exitCode == 0 && list.out.contains("vic") && list.out.contains("bob"));
-    QVERIFY(json.exitCode == 0 && json.out.startsWith('{') && json.out.contains("\"vic\""));
-}
-
 FTPCONFIG_TEST_GUILESS_MAIN(TestCtl)
+
 #include "TestCtl.moc"

@@ -85,60 +85,58 @@ class TestLoginForecast : public QObject
     Q_OBJECT
 
 private slots:
-    void initTestCase();
-    void forecast_data();
-    void forecast();
+    void initTestCase()
+    {
+        QStandardPaths::setTestModeEnabled(true);
+    }
+
+    void forecast_data()
+    {
+        addScenarioRows(QStringLiteral("forecast.txt"));
+    }
+
+    void forecast()
+    {
+        QFETCH(Scenario, scenario);
+        EngineFixture engine(FtpServerConfig::Mode::ReadOnly);
+        QVERIFY(engine.write(scenario.files));
+        QVERIFY(prepare(engine.root, scenario.value(QStringLiteral("setup"))));
+        QVERIFY(engine.start());
+        LoginForecast forecast(*engine.config, Today);
+
+        const bool fails = scenario.value(QStringLiteral("server")) == QLatin1String("fails");
+        const QString serverFinding = scenario.value(QStringLiteral("server-finding"));
+        QCOMPARE(forecast.serverFails(), fails);
+        QCOMPARE(first(forecast.serverFindings()).left(serverFinding.size()), serverFinding);
+        if (serverFinding.isEmpty())
+            QCOMPARE(forecast.serverFindings().size(), 0);
+        // A server that does not start refuses everybody with the same reason.
+        for (const QByteArray &user : {QByteArray("bob"), QByteArray("Anonymous users")}) {
+            const UserForecast login = forecast.forecast(user);
+            QVERIFY(!fails
+                    || (login.status == ForecastStatus::Denied
+                        && login.findings.constFirst().message == forecast.serverFindings().constFirst().message));
+        }
+        if (!scenario.has(QStringLiteral("user")))
+            return;
+        const UserForecast login = forecast.forecast(scenario.bytes(QStringLiteral("user")));
+        const QString finding = scenario.value(QStringLiteral("finding"));
+        QCOMPARE(first(login.findings).left(finding.size()), finding);
+        // Where ssl_enable is on, what a TLS client gets: the start of its finding.
+        if (scenario.has(QStringLiteral("tls"))) {
+            const auto tls = std::find_if(login.findings.begin(), login.findings.end(), [](const ForecastFinding &f) {
+                return f.message.startsWith(QLatin1String("a TLS client"));
+            });
+            QVERIFY(tls != login.findings.end());
+            QCOMPARE(tls->message.left(scenario.value(QStringLiteral("tls")).size()),
+                     scenario.value(QStringLiteral("tls")));
+        }
+        static const QStringList statuses{QStringLiteral("allowed"), QStringLiteral("denied"),
+                                          QStringLiteral("unknown")};
+        QCOMPARE(statuses.value(static_cast<int>(login.status)), scenario.value(QStringLiteral("status")));
+    }
 };
 
-void TestLoginForecast::initTestCase()
-{
-    QStandardPaths::setTestModeEnabled(true);
-}
-
-void TestLoginForecast::forecast_data()
-{
-    addScenarioRows(QStringLiteral("forecast.txt"));
-}
-
-void TestLoginForecast::forecast()
-{
-    QFETCH(Scenario, scenario);
-    EngineFixture engine(FtpServerConfig::Mode::ReadOnly);
-    QVERIFY(engine.write(scenario.files));
-    QVERIFY(prepare(engine.root, scenario.value(QStringLiteral("setup"))));
-    QVERIFY(engine.start());
-    LoginForecast forecast(*engine.config, Today);
-
-    const bool fails = scenario.value(QStringLiteral("server")) == QLatin1String("fails");
-    const QString serverFinding = scenario.value(QStringLiteral("server-finding"));
-    QCOMPARE(forecast.serverFails(), fails);
-    QCOMPARE(first(forecast.serverFindings()).left(serverFinding.size()), serverFinding);
-    if (serverFinding.isEmpty())
-        QCOMPARE(forecast.serverFindings().size(), 0);
-    // A server that does not start refuses everybody with the same reason.
-    for (const QByteArray &user : {QByteArray("bob"), QByteArray("Anonymous users")}) {
-        const UserForecast login = forecast.forecast(user);
-        QVERIFY(!fails
-                || (login.status == ForecastStatus::Denied
-                    && login.findings.constFirst().message == forecast.serverFindings().constFirst().message));
-    }
-    if (!scenario.has(QStringLiteral("user")))
-        return;
-    const UserForecast login = forecast.forecast(scenario.bytes(QStringLiteral("user")));
-    const QString finding = scenario.value(QStringLiteral("finding"));
-    QCOMPARE(first(login.findings).left(finding.size()), finding);
-    // Where ssl_enable is on, what a TLS client gets: the start of its finding.
-    if (scenario.has(QStringLiteral("tls"))) {
-        const auto tls = std::find_if(login.findings.begin(), login.findings.end(), [](const ForecastFinding &f) {
-            return f.message.startsWith(QLatin1String("a TLS client"));
-        });
-        QVERIFY(tls != login.findings.end());
-        QCOMPARE(tls->message.left(scenario.value(QStringLiteral("tls")).size()),
-                 scenario.value(QStringLiteral("tls")));
-    }
-    static const QStringList statuses{QStringLiteral("allowed"), QStringLiteral("denied"), QStringLiteral("unknown")};
-    QCOMPARE(statuses.value(static_cast<int>(login.status)), scenario.value(QStringLiteral("status")));
-}
-
 FTPCONFIG_TEST_GUILESS_MAIN(TestLoginForecast)
+
 #include "TestLoginForecast.moc"
