@@ -56,6 +56,15 @@ const QByteArray allKeys = "# every option of the dialog\n"
 
 const QString conf = QStringLiteral("/etc/vsftpd.conf");
 
+QString utf8(const char *text)
+{
+    return QString::fromUtf8(text);
+}
+QString utf8(const QString &text)
+{
+    return text;
+}
+
 QByteArray debianStock()
 {
     QFile file(QStringLiteral(FTPCONFIG_TEST_DATA "/debian-vsftpd.conf"));
@@ -246,21 +255,29 @@ private Q_SLOTS:
     }
 
     // Every key: the file's value in its widget, and a change of the
-    // widget written into that key's line alone.
+    // widget written into that key's line alone. Rates are bytes per second
+    // in the file, megabytes per second in the dialog. A key missing from the
+    // file shows its default and, left so, is not written.
     void keys_data()
     {
+        QTest::addColumn<QByteArray>("text");
         QTest::addColumn<QByteArray>("key");
         QTest::addColumn<QString>("widget");
         QTest::addColumn<QString>("shown");
         QTest::addColumn<QString>("changed");
         QTest::addColumn<QString>("written");
-        const auto row
-            = [](const char *key, const char *widget, const char *shown, const char *changed, const char *written) {
-                  QTest::newRow(key) << QByteArray(key) << QString::fromUtf8(widget) << QString::fromUtf8(shown)
-                                     << QString::fromUtf8(changed) << QString::fromUtf8(written);
-              };
+        const auto in = [](const char *name, const QByteArray &text, const char *key, const char *widget,
+                           const auto &shown, const auto &changed, const auto &written) {
+            QTest::newRow(name) << text << QByteArray(key) << utf8(widget) << utf8(shown) << utf8(changed)
+                                << utf8(written);
+        };
+        const auto row = [&in](const char *key, const char *widget, const auto &shown, const auto &changed,
+                               const auto &written) { in(key, allKeys, key, widget, shown, changed, written); };
         const auto toggle = [&row](const char *key, const char *widget, bool on) {
             row(key, widget, on ? "on" : "off", on ? "off" : "on", on ? "NO" : "YES");
+        };
+        const auto unset = [&in](const char *widget, const auto &shown) {
+            in(widget, "listen=YES\n", "", widget, shown, shown, absent);
         };
         toggle("guest_enable", "guestEnableCheckBox", true);
         row("guest_username", "guestUsernameComboBox", "bob", "root", "root");
@@ -271,8 +288,7 @@ private Q_SLOTS:
         row("ftpd_banner", "ftpdBannerLineEdit", "Welcome to the test server", "Hi", "Hi");
         row("banner_file", "bannerFileLineEdit", "/etc/vsftpd.banner", "/etc/issue.ftp", "/etc/issue.ftp");
         row("cmds_allowed", "commandsListWidget", "USER,PASS,QUIT", "USER,PASS", "USER,PASS");
-        QTest::newRow("cmds_allowed unchecked") << QByteArray("cmds_allowed") << QStringLiteral("cmdsAllowedGroupBox")
-                                                << QStringLiteral("on") << QStringLiteral("off") << absent;
+        in("cmds_allowed unchecked", allKeys, "cmds_allowed", "cmdsAllowedGroupBox", "on", "off", absent);
         row("deny_file", "denyFileLineEdit", "{*.mp3,.private}", "", "<absent>");
         row("hide_file", "hideFileLineEdit", "{.hidden}", "{*.bak}", "{*.bak}");
         toggle("anonymous_enable", "anonymousEnableCheckBox", false);
@@ -296,14 +312,10 @@ private Q_SLOTS:
         row("listen_port", "listenPortSpinBox", "2121", "21", "21");
         row("max_clients", "maxClientsSpinBox", "50", "0", "0");
         row("max_per_ip", "maxPerIpSpinBox", "4", "10", "10");
-        QTest::newRow("listen") << QByteArray("listen") << QStringLiteral("listenerComboBox") << both
-                                << QStringLiteral("IPv6 (and IPv4 where the system maps it)") << QStringLiteral("NO");
-        QTest::newRow("listen_ipv6") << QByteArray("listen_ipv6") << QStringLiteral("listenerComboBox") << both
-                                     << QStringLiteral("IPv4") << QStringLiteral("NO");
-        QTest::newRow("listen_address") << QByteArray("listen_address") << QStringLiteral("listenAddressComboBox")
-                                        << QStringLiteral("192.0.2.7") << allInterfaces << QStringLiteral("0.0.0.0");
-        QTest::newRow("listen_address6") << QByteArray("listen_address6") << QStringLiteral("listenAddress6ComboBox")
-                                         << QStringLiteral("2001:db8::7") << allInterfaces << QStringLiteral("::");
+        row("listen", "listenerComboBox", both, "IPv6 (and IPv4 where the system maps it)", "NO");
+        row("listen_ipv6", "listenerComboBox", both, "IPv4", "NO");
+        row("listen_address", "listenAddressComboBox", "192.0.2.7", allInterfaces, "0.0.0.0");
+        row("listen_address6", "listenAddress6ComboBox", "2001:db8::7", allInterfaces, "::");
         toggle("download_enable", "downloadEnableCheckBox", false);
         toggle("ascii_download_enable", "asciiDownloadEnableCheckBox", true);
         toggle("ascii_upload_enable", "asciiUploadEnableCheckBox", true);
@@ -329,16 +341,41 @@ private Q_SLOTS:
         toggle("force_dot_files", "forceDotFilesCheckBox", true);
         toggle("hide_ids", "hideIdsCheckBox", true);
         row("message_file", "messageFileLineEdit", ".welcome", "/srv/ftp/.message", "/srv/ftp/.message");
+        in("a rate read as strtod reads", "listen=YES\nlocal_max_rate=2.5e6x\n", "local_max_rate",
+           "localMaxRateDoubleSpinBox", "2.38", "0.50", "524288");
+        in("a rate that is no number", "listen=YES\nlocal_max_rate=fast\n", "local_max_rate",
+           "localMaxRateDoubleSpinBox", "0.00", "4095.99", "4294956032");
+        in("a rate absent is unlimited", "listen=YES\n", "anon_max_rate", "anonMaxRateDoubleSpinBox", "0.00", "2.50",
+           "2621440");
+        unset("listenPortSpinBox", "21");
+        unset("messageFileLineEdit", ".message");
+        unset("ftpDataPortSpinBox", "20");
+        unset("idleSessionTimeoutSpinBox", "300");
+        unset("delayFailedLoginSpinBox", "1");
+        unset("anonUmaskLineEdit", "077");
+        unset("chownUploadModeLineEdit", "0600");
+        unset("chownUsernameComboBox", "root");
+        unset("guestUsernameComboBox", "ftp");
+        unset("bannedEmailFileLineEdit", "/etc/vsftpd.banned_emails");
+        unset("chrootListFileLineEdit", "/etc/vsftpd.chroot_list");
+        unset("anonymousEnableCheckBox", "on");
+        unset("mdtmWriteCheckBox", "on");
+        unset("localEnableCheckBox", "off");
+        unset("cmdsAllowedGroupBox", "off");
+        unset("listenerComboBox", "IPv4");
+        unset("listenAddressComboBox", allInterfaces);
+        unset("chrootChoiceGroupBox", "chrootNobodyRadioButton");
     }
     void keys()
     {
+        QFETCH(QByteArray, text);
         QFETCH(QByteArray, key);
         QFETCH(QString, widget);
         QFETCH(QString, shown);
         QFETCH(QString, changed);
         QFETCH(QString, written);
         Opened opened;
-        QVERIFY(opened.open({{conf, allKeys}}));
+        QVERIFY(opened.open({{conf, text}}));
         QWidget *edited = opened.child(widget);
         QVERIFY2(edited, qPrintable(widget));
         QCOMPARE(stateOf(edited), shown);
@@ -347,79 +384,6 @@ private Q_SLOTS:
         QVERIFY(opened.accept());
         QCOMPARE(opened.value(key), written);
         QCOMPARE(linesWithout(opened.engine.mainText(), key), linesWithout(opened.before, key));
-    }
-
-    // Bytes per second in the file, megabytes per second in the dialog.
-    void rates_data()
-    {
-        QTest::addColumn<QString>("widget");
-        QTest::addColumn<QByteArray>("file");
-        QTest::addColumn<QString>("shown");
-        QTest::addColumn<double>("changed");
-        QTest::addColumn<QString>("written");
-        const QString anon = QStringLiteral("anonMaxRateDoubleSpinBox");
-        const QString local = QStringLiteral("localMaxRateDoubleSpinBox");
-        QTest::newRow("1 byte shows as the least limit")
-            << anon << QByteArray("anon_max_rate=1\n") << QStringLiteral("0.01") << 1.0 << QStringLiteral("1048576");
-        QTest::newRow("1 MB/s") << local << QByteArray("local_max_rate=1048576\n") << QStringLiteral("1.00") << 0.01
-                                << QStringLiteral("10240");
-        QTest::newRow("absent is unlimited")
-            << anon << QByteArray() << QStringLiteral("0.00") << 2.5 << QStringLiteral("2621440");
-        QTest::newRow("read as strtod reads") << local << QByteArray("local_max_rate=2.5e6x\n")
-                                              << QStringLiteral("2.38") << 0.5 << QStringLiteral("524288");
-        QTest::newRow("no number") << local << QByteArray("local_max_rate=fast\n") << QStringLiteral("0.00") << 4095.99
-                                   << QStringLiteral("4294956032");
-    }
-    void rates()
-    {
-        QFETCH(QString, widget);
-        QFETCH(QByteArray, file);
-        QFETCH(QString, shown);
-        QFETCH(double, changed);
-        QFETCH(QString, written);
-        Opened opened;
-        QVERIFY(opened.open({{conf, "listen=YES\n" + file}}));
-        auto *spin = opened.child<QDoubleSpinBox>(widget);
-        QCOMPARE(stateOf(spin), shown);
-        spin->setValue(changed);
-        QVERIFY(opened.accept());
-        QCOMPARE(opened.value(widget.startsWith(QLatin1String("anon")) ? "anon_max_rate" : "local_max_rate"), written);
-    }
-
-    // What a key missing from the file shows.
-    void defaults_data()
-    {
-        QTest::addColumn<QString>("widget");
-        QTest::addColumn<QString>("shown");
-        const auto row = [](const char *widget, const char *shown) {
-            QTest::newRow(widget) << QString::fromUtf8(widget) << QString::fromUtf8(shown);
-        };
-        row("listenPortSpinBox", "21");
-        row("messageFileLineEdit", ".message");
-        row("ftpDataPortSpinBox", "20");
-        row("idleSessionTimeoutSpinBox", "300");
-        row("delayFailedLoginSpinBox", "1");
-        row("anonUmaskLineEdit", "077");
-        row("chownUploadModeLineEdit", "0600");
-        row("chownUsernameComboBox", "root");
-        row("guestUsernameComboBox", "ftp");
-        row("bannedEmailFileLineEdit", "/etc/vsftpd.banned_emails");
-        row("chrootListFileLineEdit", "/etc/vsftpd.chroot_list");
-        row("anonymousEnableCheckBox", "on");
-        row("mdtmWriteCheckBox", "on");
-        row("localEnableCheckBox", "off");
-        row("cmdsAllowedGroupBox", "off");
-        row("listenerComboBox", "IPv4");
-        row("listenAddressComboBox", allInterfaces.toUtf8().constData());
-        row("chrootChoiceGroupBox", "chrootNobodyRadioButton");
-    }
-    void defaults()
-    {
-        QFETCH(QString, widget);
-        QFETCH(QString, shown);
-        Opened opened;
-        QVERIFY(opened.open({{conf, "listen=YES\n"}}));
-        QCOMPARE(stateOf(opened.child(widget)), shown);
     }
 
     // The add buttons of the command and e-mail lists: what is asked, what
