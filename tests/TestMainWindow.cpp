@@ -246,31 +246,6 @@ private Q_SLOTS:
                  m_f.window->model()->isUserRow(m_f.source(row)) ? row : QString());
     }
 
-    void deleteVirtualUser_data()
-    {
-        QTest::addColumn<QString>("answer");
-        QTest::addColumn<bool>("removed");
-        QTest::newRow("OK removes") << "OK" << true;
-        QTest::newRow("Cancel keeps") << "Cancel" << false;
-    }
-
-    void deleteVirtualUser()
-    {
-        QFETCH(QString, answer);
-        QFETCH(bool, removed);
-        QVERIFY(m_f.select(QStringLiteral("carol")));
-        ModalHelper modal;
-        modal.expect(QStringLiteral("Are you sure you want to delete virtual user carol?"), answer);
-        m_f.window->deleteUser();
-        QVERIFY2(modal.done(), qPrintable(modal.report()));
-        QCOMPARE(modal.seen().first().icon, QMessageBox::Warning);
-        QCOMPARE(m_f.source(QStringLiteral("carol")).isValid(), !removed);
-        QVERIFY(m_f.source(QStringLiteral("dave")).isValid());
-        QCOMPARE(m_f.action("actionSave")->isEnabled(), removed);
-        if (removed)
-            QVERIFY(!m_f.action("actionDelete_user")->isVisible());
-    }
-
     void loginCheckFollowsEdits()
     {
         QVERIFY(m_f.select(QStringLiteral("bob")));
@@ -683,34 +658,45 @@ private Q_SLOTS:
         QCOMPARE(restored, original);
     }
 
-    void noVirtualUserSelected_data()
+    // Delete asks first; edit and delete want a virtual user selected.
+    void editOrDelete_data()
     {
         QTest::addColumn<bool>("editing");
         QTest::addColumn<QString>("row");
-
-        QTest::newRow("edit, no row") << true << QString();
-        QTest::newRow("edit, local user") << true << QStringLiteral("bob");
-        QTest::newRow("edit, group") << true << QStringLiteral("Virtual users");
-        QTest::newRow("delete, no row") << false << QString();
-        QTest::newRow("delete, local user") << false << QStringLiteral("bob");
+        QTest::addColumn<QString>("answer"); // null: told to select one
+        QTest::addColumn<bool>("removed");
+        QTest::newRow("delete, OK removes") << false << "carol"
+                                            << "OK" << true;
+        QTest::newRow("delete, Cancel keeps") << false << "carol"
+                                              << "Cancel" << false;
+        QTest::newRow("edit, no row") << true << QString() << QString() << false;
+        QTest::newRow("edit, local user") << true << "bob" << QString() << false;
+        QTest::newRow("edit, group") << true << "Virtual users" << QString() << false;
+        QTest::newRow("delete, no row") << false << QString() << QString() << false;
+        QTest::newRow("delete, local user") << false << "bob" << QString() << false;
     }
 
-    void noVirtualUserSelected()
+    void editOrDelete()
     {
         QFETCH(bool, editing);
         QFETCH(QString, row);
-
+        QFETCH(QString, answer);
+        QFETCH(bool, removed);
         QVERIFY(m_f.select(row));
         ModalHelper modal;
-        modal.expect(QStringLiteral("Please, select virtual user which has to be changed."), QStringLiteral("OK"));
-        if (editing)
-            m_f.window->editUser();
+        if (answer.isNull())
+            modal.expect(QStringLiteral("Please, select virtual user which has to be changed."), QStringLiteral("OK"));
         else
-            m_f.window->deleteUser();
+            modal.expect(QStringLiteral("Are you sure you want to delete virtual user carol?"), answer);
+        editing ? m_f.window->editUser() : m_f.window->deleteUser();
         QVERIFY2(modal.done(), qPrintable(modal.report()));
         QCOMPARE(modal.seen().first().icon, QMessageBox::Warning);
-        QCOMPARE(m_f.window->model()->config().virtualUserNames().size(), 2);
-        QVERIFY(!m_f.action("actionSave")->isEnabled());
+        QCOMPARE(m_f.source(QStringLiteral("carol")).isValid(), !removed);
+        QVERIFY(m_f.source(QStringLiteral("dave")).isValid());
+        QCOMPARE(m_f.window->model()->config().virtualUserNames().size(), removed ? 1 : 2);
+        QCOMPARE(m_f.action("actionSave")->isEnabled(), removed);
+        if (removed)
+            QVERIFY(!m_f.action("actionDelete_user")->isVisible());
     }
 
 private:
