@@ -14,6 +14,12 @@ const QString Ctl = QStringLiteral(FTPCONFIG_CTL);
 const QByteArray Backup = ".ftpconfig-bak";
 using Passwords = QMap<QByteArray, QByteArray>;
 
+// A command line as the tables write it: words split at blanks.
+QStringList words(const char *line)
+{
+    return QString::fromUtf8(line).split(QLatin1Char(' '));
+}
+
 // A fixture root with the virtual user "vic" (password "secret") and a
 // main configuration only its owner may read.
 struct CtlRoot : FixtureRoot
@@ -102,41 +108,24 @@ private slots:
         const Passwords vic{{"vic", "secret"}};
         const QString conf = QStringLiteral("/etc/vsftpd.conf");
         const QString userlist = QStringLiteral("/etc/vsftpd.d/allowed_user_list.conf");
-        QTest::newRow("allow") << QStringList{QStringLiteral("allow"), QStringLiteral("bob")} << QByteArray()
-                               << FileMap{{userlist, "alice\nbob\n"}, {conf, "userlist_enable=yes\n"}} << QByteArray()
-                               << vic;
+        const QString bob = QStringLiteral("/etc/vsftpd.d/users.d/bob");
+        const auto row = [](const char *command, const QByteArray &input, const FileMap &lines,
+                            const QByteArray &planLine, const Passwords &users) {
+            QTest::newRow(command) << words(command) << input << lines << planLine << users;
+        };
+        row("allow bob", {}, {{userlist, "alice\nbob\n"}, {conf, "userlist_enable=yes\n"}}, {}, vic);
         // The allowed list becomes a list of the denied: asked, and emptied.
-        QTest::newRow("deny") << QStringList{QStringLiteral("--yes"), QStringLiteral("deny"), QStringLiteral("bob")}
-                              << QByteArray() << FileMap{{userlist, "bob\n"}, {conf, "userlist_deny=yes\n"}}
-                              << QByteArray() << vic;
-        QTest::newRow("root") << QStringList{QStringLiteral("--yes"), QStringLiteral("root"), QStringLiteral("bob"),
-                                             QStringLiteral("/srv/bob")}
-                              << QByteArray()
-                              << FileMap{{QStringLiteral("/etc/vsftpd.d/users.d/bob"), "local_root=/srv/bob\n"},
-                                         {QStringLiteral("/etc/vsftpd.chroot_list"), "bob\n"}}
-                              << QByteArray() << vic;
-        QTest::newRow("rights") << QStringList{QStringLiteral("rights"), QStringLiteral("bob"),
-                                               QStringLiteral("write,download")}
-                                << QByteArray()
-                                << FileMap{{QStringLiteral("/etc/vsftpd.d/users.d/bob"), "anon_upload_enable=no\n"}}
-                                << QByteArray() << vic;
-        QTest::newRow("set") << QStringList{QStringLiteral("set"), QStringLiteral("ftpd_banner"), QStringLiteral("Hi")}
-                             << QByteArray() << FileMap{{conf, "ftpd_banner=Hi\n"}} << QByteArray() << vic;
-        QTest::newRow("unset") << QStringList{QStringLiteral("unset"), QStringLiteral("chroot_local_user")}
-                               << QByteArray() << FileMap{{conf, "local_enable=YES\n"}} << QByteArray() << vic;
-        QTest::newRow("vuser add") << QStringList{QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve")}
-                                   << QByteArray("pw eve\n") << FileMap()
-                                   << QByteArray("virtual user added to /etc/vsftpd/virtual.db: eve\n")
-                                   << Passwords{{"vic", "secret"}, {"eve", "pw eve"}};
-        QTest::newRow("vuser passwd") << QStringList{QStringLiteral("vuser"), QStringLiteral("passwd"),
-                                                     QStringLiteral("vic")}
-                                      << QByteArray("new\n") << FileMap()
-                                      << QByteArray("virtual user changed in /etc/vsftpd/virtual.db: vic (password)\n")
-                                      << Passwords{{"vic", "new"}};
-        QTest::newRow("vuser del") << QStringList{QStringLiteral("vuser"), QStringLiteral("del"), QStringLiteral("vic")}
-                                   << QByteArray() << FileMap()
-                                   << QByteArray("virtual user removed from /etc/vsftpd/virtual.db: vic\n")
-                                   << Passwords();
+        row("--yes deny bob", {}, {{userlist, "bob\n"}, {conf, "userlist_deny=yes\n"}}, {}, vic);
+        row("--yes root bob /srv/bob", {},
+            {{bob, "local_root=/srv/bob\n"}, {QStringLiteral("/etc/vsftpd.chroot_list"), "bob\n"}}, {}, vic);
+        row("rights bob write,download", {}, {{bob, "anon_upload_enable=no\n"}}, {}, vic);
+        row("set ftpd_banner Hi", {}, {{conf, "ftpd_banner=Hi\n"}}, {}, vic);
+        row("unset chroot_local_user", {}, {{conf, "local_enable=YES\n"}}, {}, vic);
+        row("vuser add eve", "pw eve\n", {}, "virtual user added to /etc/vsftpd/virtual.db: eve\n",
+            {{"vic", "secret"}, {"eve", "pw eve"}});
+        row("vuser passwd vic", "new\n", {}, "virtual user changed in /etc/vsftpd/virtual.db: vic (password)\n",
+            {{"vic", "new"}});
+        row("vuser del vic", {}, {}, "virtual user removed from /etc/vsftpd/virtual.db: vic\n", {});
     }
 
     // Each command twice on the same root: a dry run writes nothing, and its
@@ -204,38 +193,29 @@ private slots:
         const auto row
             = [](const char *name, const QStringList &arguments, const QByteArray &input, int status,
                  const QByteArray &message) { QTest::newRow(name) << arguments << input << status << message; };
-        row("question without --yes", {QStringLiteral("root"), QStringLiteral("bob"), QStringLiteral("/srv/bob")}, {},
-            2, "a question needs an answer (run with --yes to accept its repair):\nThis user is not chroot'ed");
-        row("password argument",
-            {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve"), QStringLiteral("pw")}, "pw\n", 2,
-            "a password is read from standard input, never from the command line");
-        row("password option", {QStringLiteral("--password=pw"), QStringLiteral("vuser"), QStringLiteral("add")}, {}, 2,
-            "a password is read from standard input, never from the command line");
-        row("no password", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("eve")}, {}, 1,
-            "no password on standard input");
-        row("bad name", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral(".eve")}, "pw\n", 1,
+        const QByteArray onStdin = "a password is read from standard input, never from the command line";
+        row("question without --yes", words("root bob /srv/bob"), {}, 2,
+            "a question needs an answer (run with --yes to accept its repair):\nThis user is not chroot'ed");
+        row("password argument", words("vuser add eve pw"), "pw\n", 2, onStdin);
+        row("password option", words("--password=pw vuser add"), {}, 2, onStdin);
+        row("no password", words("vuser add eve"), {}, 1, "no password on standard input");
+        row("bad name", words("vuser add .eve"), "pw\n", 1,
             "\".eve\" cannot be a user name: the name begins with \".\".");
-        row("name of an account", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("bob")}, "pw\n", 1,
-            "A user named bob exists already.");
-        row("virtual user twice", {QStringLiteral("vuser"), QStringLiteral("add"), QStringLiteral("vic")}, "pw\n", 1,
-            "User vic allready exists in users database.");
-        row("no such virtual user", {QStringLiteral("vuser"), QStringLiteral("del"), QStringLiteral("bob")}, {}, 1,
+        row("name of an account", words("vuser add bob"), "pw\n", 1, "A user named bob exists already.");
+        row("virtual user twice", words("vuser add vic"), "pw\n", 1, "User vic allready exists in users database.");
+        row("no such virtual user", words("vuser del bob"), {}, 1,
             "Unable to find information about virtual user bob in database.");
-        row("unknown key", {QStringLiteral("set"), QStringLiteral("no_such_key"), QStringLiteral("yes")}, {}, 1,
+        row("unknown key", words("set no_such_key yes"), {}, 1,
             "unknown setting \"no_such_key\": vsftpd stops (unrecognised variable in config file)");
-        row("bad bool", {QStringLiteral("set"), QStringLiteral("listen"), QStringLiteral("maybe")}, {}, 1,
-            "listen=\"maybe\" is not a yes/no value");
-        row("bad number", {QStringLiteral("set"), QStringLiteral("listen_port"), QStringLiteral("21a")}, {}, 1,
-            "listen_port=\"21a\" is not a number");
-        row("unknown user", {QStringLiteral("allow"), QStringLiteral("ghost")}, {}, 1, "no user named ghost");
-        row("refused allow", {QStringLiteral("allow"), QStringLiteral("locked")}, {}, 1,
+        row("bad bool", words("set listen maybe"), {}, 1, "listen=\"maybe\" is not a yes/no value");
+        row("bad number", words("set listen_port 21a"), {}, 1, "listen_port=\"21a\" is not a number");
+        row("unknown user", words("allow ghost"), {}, 1, "no user named ghost");
+        row("refused allow", words("allow locked"), {}, 1,
             "Unable to change access status.\n***Result: FALSE. Check: user locked  has bad passwd");
-        row("unknown right", {QStringLiteral("rights"), QStringLiteral("bob"), QStringLiteral("write, fly")}, {}, 1,
-            "\"fly\" is no right");
-        row("relative root", {QStringLiteral("root"), QStringLiteral("bob"), QStringLiteral("srv")}, {}, 1,
-            "The directory must be an absolute path.");
-        row("unknown command", {QStringLiteral("frobnicate")}, {}, 2, "unknown command: frobnicate");
-        row("missing argument", {QStringLiteral("set"), QStringLiteral("listen")}, {}, 2, "set takes 2 argument(s)");
+        row("unknown right", words("rights bob") << QStringLiteral("write, fly"), {}, 1, "\"fly\" is no right");
+        row("relative root", words("root bob srv"), {}, 1, "The directory must be an absolute path.");
+        row("unknown command", words("frobnicate"), {}, 2, "unknown command: frobnicate");
+        row("missing argument", words("set listen"), {}, 2, "set takes 2 argument(s)");
     }
 
     void refusals()
@@ -257,10 +237,10 @@ private slots:
     void listAndGet()
     {
         CtlRoot root;
-        const auto list = root.run({QStringLiteral("list")});
-        const auto json = root.run({QStringLiteral("list"), QStringLiteral("--json")});
-        const auto get = root.run({QStringLiteral("get"), QStringLiteral("local_enable")});
-        const auto unset = root.run({QStringLiteral("get"), QStringLiteral("ftpd_banner")});
+        const auto list = root.run(words("list"));
+        const auto json = root.run(words("list --json"));
+        const auto get = root.run(words("get local_enable"));
+        const auto unset = root.run(words("get ftpd_banner"));
         QCOMPARE(get.exitCode, 0);
         QCOMPARE(get.out, QByteArray("YES\n"));
         QCOMPARE(unset.exitCode, 1);
