@@ -170,8 +170,11 @@ struct Opened
 {
     bool open(const FileMap &files)
     {
-        if (!engine.load(files))
-            return false;
+        return engine.load(files) && show();
+    }
+    // Over the engine as it is now.
+    bool show()
+    {
         before = engine.mainText();
         dialog = std::make_unique<COptionsDialog>(*engine.config);
         dialog->load();
@@ -544,11 +547,7 @@ private Q_SLOTS:
         QVERIFY(opened.engine.start());
         // A change of the table, not saved yet.
         opened.engine.config->chrootList().append(QStringLiteral("alice"));
-        opened.before = opened.engine.mainText();
-        opened.dialog = std::make_unique<COptionsDialog>(*opened.engine.config);
-        opened.dialog->load();
-        opened.dialog->setWindowModality(Qt::NonModal);
-        opened.dialog->show();
+        QVERIFY(opened.show());
 
         auto *listed = opened.child<QListWidget>(QStringLiteral("chrootUsersListWidget"));
         auto *users = opened.child<QListWidget>(QStringLiteral("usersListWidget"));
