@@ -269,45 +269,47 @@ private Q_SLOTS:
         QTest::addColumn<QString>("shown");
         QTest::addColumn<QString>("changed");
         QTest::addColumn<QString>("written");
-        const auto in = [](const char *name, const QByteArray &text, const char *key, const char *widget,
+        const auto in = [](const char *name, const QByteArray &text, const char *key, const auto &widget,
                            const auto &shown, const auto &changed, const auto &written) {
             QTest::newRow(name) << text << QByteArray(key) << utf8(widget) << utf8(shown) << utf8(changed)
                                 << utf8(written);
         };
-        const auto row = [&in](const char *key, const char *widget, const auto &shown, const auto &changed,
+        const auto row = [&in](const char *key, const auto &widget, const auto &shown, const auto &changed,
                                const auto &written) { in(key, allKeys, key, widget, shown, changed, written); };
-        const auto toggle = [&row](const char *key, const char *widget, bool on) {
-            row(key, widget, on ? "on" : "off", on ? "off" : "on", on ? "NO" : "YES");
+        // A key's check box is named after it: guest_enable, guestEnableCheckBox.
+        const auto toggles = [&in](bool on, std::initializer_list<const char *> keys) {
+            for (const char *key : keys) {
+                QString widget = QString::fromUtf8(key) + QStringLiteral("CheckBox");
+                for (int at; (at = widget.indexOf(QLatin1Char('_'))) >= 0;)
+                    widget.replace(at, 2, widget.at(at + 1).toUpper());
+                in(key, allKeys, key, widget, on ? "on" : "off", on ? "off" : "on", on ? "NO" : "YES");
+            }
         };
+        toggles(true, {"guest_enable",          "local_enable",        "write_enable",         "allow_writeable_chroot",
+                       "xferlog_enable",        "no_anon_password",    "connect_from_port_20", "session_support",
+                       "ascii_download_enable", "ascii_upload_enable", "async_abor_enable",    "chown_uploads",
+                       "delete_failed_uploads", "log_ftp_protocol",    "ls_recurse_enable",    "use_localtime",
+                       "dirmessage_enable",     "dual_log_enable",     "force_dot_files",      "hide_ids"});
+        toggles(false,
+                {"anonymous_enable", "anon_world_readable_only", "pasv_enable", "port_enable", "download_enable",
+                 "mdtm_write", "chmod_enable", "dirlist_enable"});
         const auto unset = [&in](const char *widget, const auto &shown) {
             in(widget, "listen=YES\n", "", widget, shown, shown, absent);
         };
-        toggle("guest_enable", "guestEnableCheckBox", true);
         row("guest_username", "guestUsernameComboBox", "bob", "root", "root");
-        toggle("local_enable", "localEnableCheckBox", true);
-        toggle("write_enable", "writeEnableCheckBox", true);
-        toggle("allow_writeable_chroot", "allowWriteableChrootCheckBox", true);
-        toggle("xferlog_enable", "xferlogEnableCheckBox", true);
         row("ftpd_banner", "ftpdBannerLineEdit", "Welcome to the test server", "Hi", "Hi");
         row("banner_file", "bannerFileLineEdit", "/etc/vsftpd.banner", "/etc/issue.ftp", "/etc/issue.ftp");
         row("cmds_allowed", "commandsListWidget", "USER,PASS,QUIT", "USER,PASS", "USER,PASS");
         in("cmds_allowed unchecked", allKeys, "cmds_allowed", "cmdsAllowedGroupBox", "on", "off", absent);
         row("deny_file", "denyFileLineEdit", "{*.mp3,.private}", "", "<absent>");
         row("hide_file", "hideFileLineEdit", "{.hidden}", "{*.bak}", "{*.bak}");
-        toggle("anonymous_enable", "anonymousEnableCheckBox", false);
-        toggle("anon_world_readable_only", "anonWorldReadableOnlyCheckBox", false);
-        toggle("no_anon_password", "noAnonPasswordCheckBox", true);
         row("anon_max_rate", "anonMaxRateDoubleSpinBox", "0.01", "2.50", "2621440");
         row("ftp_username", "ftpUsernameComboBox", "alice", "ftp", "ftp");
         row("anon_umask", "anonUmaskLineEdit", "022", "027", "027");
         row("chown_upload_mode", "chownUploadModeLineEdit", "0644", "0600", "0600");
         row("chown_username", "chownUsernameComboBox", "nosuchuser", "root", "root");
         row("banned_email_file", "bannedEmailFileLineEdit", "/etc/banned", "", "<absent>");
-        toggle("deny_email_enable", "denyEmailEnableGroupBox", true);
-        toggle("connect_from_port_20", "connectFromPort20CheckBox", true);
-        toggle("pasv_enable", "pasvEnableCheckBox", false);
-        toggle("port_enable", "portEnableCheckBox", false);
-        toggle("session_support", "sessionSupportCheckBox", true);
+        in("deny_email_enable", allKeys, "deny_email_enable", "denyEmailEnableGroupBox", "on", "off", "NO");
         row("delay_failed_login", "delayFailedLoginSpinBox", "5", "0", "0");
         row("delay_successful_login", "delaySuccessfulLoginSpinBox", "2", "3", "3");
         row("idle_session_timeout", "idleSessionTimeoutSpinBox", "600", "2147483647", "2147483647");
@@ -319,16 +321,6 @@ private Q_SLOTS:
         row("listen_ipv6", "listenerComboBox", both, "IPv4", "NO");
         row("listen_address", "listenAddressComboBox", "192.0.2.7", allInterfaces, "0.0.0.0");
         row("listen_address6", "listenAddress6ComboBox", "2001:db8::7", allInterfaces, "::");
-        toggle("download_enable", "downloadEnableCheckBox", false);
-        toggle("ascii_download_enable", "asciiDownloadEnableCheckBox", true);
-        toggle("ascii_upload_enable", "asciiUploadEnableCheckBox", true);
-        toggle("async_abor_enable", "asyncAborEnableCheckBox", true);
-        toggle("chown_uploads", "chownUploadsCheckBox", true);
-        toggle("delete_failed_uploads", "deleteFailedUploadsCheckBox", true);
-        toggle("log_ftp_protocol", "logFtpProtocolCheckBox", true);
-        toggle("ls_recurse_enable", "lsRecurseEnableCheckBox", true);
-        toggle("mdtm_write", "mdtmWriteCheckBox", false);
-        toggle("use_localtime", "useLocaltimeCheckBox", true);
         row("local_max_rate", "localMaxRateDoubleSpinBox", "1.00", "0.01", "10240");
         row("local_umask", "localUmaskLineEdit", "022", "002", "002");
         row("chroot_list_enable", "chrootChoiceGroupBox", "chrootAllButListedRadioButton", "chrootAllRadioButton",
@@ -337,12 +329,6 @@ private Q_SLOTS:
             "NO");
         row("chroot_list_file", "chrootListFileLineEdit", "/etc/chroot_users", "/etc/vsftpd.chroot_list",
             "/etc/vsftpd.chroot_list");
-        toggle("chmod_enable", "chmodEnableCheckBox", false);
-        toggle("dirlist_enable", "dirlistEnableCheckBox", false);
-        toggle("dirmessage_enable", "dirmessageEnableCheckBox", true);
-        toggle("dual_log_enable", "dualLogEnableCheckBox", true);
-        toggle("force_dot_files", "forceDotFilesCheckBox", true);
-        toggle("hide_ids", "hideIdsCheckBox", true);
         row("message_file", "messageFileLineEdit", ".welcome", "/srv/ftp/.message", "/srv/ftp/.message");
         in("a rate read as strtod reads", "listen=YES\nlocal_max_rate=2.5e6x\n", "local_max_rate",
            "localMaxRateDoubleSpinBox", "2.38", "0.50", "524288");
