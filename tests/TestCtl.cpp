@@ -1,6 +1,7 @@
 #include "FixtureRoot.h"
 #include "Process.h"
 #include "TestMain.h"
+#include "TestStrings.h"
 #include "accounts/VirtualUserDb.h"
 
 #include <QTemporaryDir>
@@ -13,12 +14,6 @@ namespace {
 const QString Ctl = QStringLiteral(FTPCONFIG_CTL);
 const QByteArray Backup = ".ftpconfig-bak";
 using Passwords = QMap<QByteArray, QByteArray>;
-
-// A command line as the tables write it: words split at blanks.
-QStringList words(const char *line)
-{
-    return QString::fromUtf8(line).split(QLatin1Char(' '));
-}
 
 // A fixture root with the virtual user "vic" (password "secret") and a
 // main configuration only its owner may read.

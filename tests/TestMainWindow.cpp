@@ -514,26 +514,22 @@ private Q_SLOTS:
         QTest::addColumn<QString>("message");
         QTest::addColumn<QStringList>("saved");
 
+        const auto row = [](const char *name, bool editing, const char *deletedFirst, const char *typed,
+                            const QString &message, const char *saved) {
+            QTest::newRow(name) << editing << QString::fromUtf8(deletedFirst) << words(typed) << message
+                                << words(saved);
+        };
         const QString exists = QStringLiteral("User %1 allready exists in users database.");
-        QTest::newRow("new user") << false << QString() << strings("eve", "secret", "secret") << QString()
-                                  << strings("carol=c", "dave=d", "eve=secret");
-        QTest::newRow("existing name") << false << QString() << strings("carol", "x", "x")
-                                       << exists.arg(QLatin1String("carol")) << strings("carol=c", "dave=d");
-        QTest::newRow("deleted name again") << false << QStringLiteral("dave") << strings("dave", "new", "new")
-                                            << QString() << strings("carol=c", "dave=new");
-        QTest::newRow("new password") << true << QString() << strings("carol", "c2", "c2") << QString()
-                                      << strings("carol=c2", "dave=d");
-        QTest::newRow("new name") << true << QString() << strings("eve", "c", "c") << QString()
-                                  << strings("dave=d", "eve=c");
-        QTest::newRow("new name and password")
-            << true << QString() << strings("eve", "e", "e") << QString() << strings("dave=d", "eve=e");
-        QTest::newRow("name of another user") << true << QString() << strings("dave", "c", "c")
-                                              << exists.arg(QLatin1String("dave")) << strings("carol=c", "dave=d");
         const QString local = QStringLiteral("A user named root exists already.");
-        QTest::newRow("local account's name")
-            << false << QString() << strings("root", "x", "x") << local << strings("carol=c", "dave=d");
-        QTest::newRow("renamed to a local account")
-            << true << QString() << strings("root", "c", "c") << local << strings("carol=c", "dave=d");
+        row("new user", false, "", "eve secret secret", {}, "carol=c dave=d eve=secret");
+        row("existing name", false, "", "carol x x", exists.arg(QLatin1String("carol")), "carol=c dave=d");
+        row("deleted name again", false, "dave", "dave new new", {}, "carol=c dave=new");
+        row("new password", true, "", "carol c2 c2", {}, "carol=c2 dave=d");
+        row("new name", true, "", "eve c c", {}, "dave=d eve=c");
+        row("new name and password", true, "", "eve e e", {}, "dave=d eve=e");
+        row("name of another user", true, "", "dave c c", exists.arg(QLatin1String("dave")), "carol=c dave=d");
+        row("local account's name", false, "", "root x x", local, "carol=c dave=d");
+        row("renamed to a local account", true, "", "root c c", local, "carol=c dave=d");
     }
 
     void addOrEdit()

@@ -8,3 +8,9 @@ template <typename... Texts> QStringList strings(const Texts &...texts)
 {
     return {QString::fromUtf8(texts)...};
 }
+
+// Words split at blanks, as a table writes a command line or a list.
+inline QStringList words(const char *line)
+{
+    return QString::fromUtf8(line).split(QLatin1Char(' '));
+}
