@@ -428,19 +428,6 @@ private slots:
         QVERIFY(engine.root.readFile(QStringLiteral("/etc/vsftpd.d/users.d/alice")).contains("write_enable"));
     }
 
-    void hiddenFilesAreNoUsers()
-    {
-        // Leftovers of an interrupted save, or an editor's backup, are no users.
-        EngineFixture engine;
-        FileMap files = richFiles();
-        files.insert(QStringLiteral("/etc/vsftpd.d/users.d/.bob.ftpconfig-Ab12Cd"), "write_enable=YES\n");
-        QVERIFY(engine.load(files));
-        QStringList users;
-        for (const auto &entry : engine.config->userConfigs())
-            users << QString::fromUtf8(entry.first);
-        QCOMPARE(users, (QStringList{QStringLiteral("alice"), QStringLiteral("bob")}));
-    }
-
     void serverReadsTheProgramsUserlist()
     {
         // Debian's configuration names no userlist: once a save enables the
