@@ -113,10 +113,13 @@ void AccountStore::buildIndexes()
             m_groupIds.insert(group.name, gid);
     }
     m_passwdIndex.reserve(static_cast<int>(m_passwd.size()));
+    // Most names asked of the accounts are virtual users' and no account.
+    m_passwdFilter.reset(static_cast<int>(m_passwd.size()));
     for (const auto &[name, record] : m_passwd) {
         if (!m_userNames.contains(record.uid))
             m_userNames.insert(record.uid, name);
         m_passwdIndex.insert(name, &record);
+        m_passwdFilter.add(name);
     }
     m_shadowIndex.reserve(static_cast<int>(m_shadow.size()));
     for (const auto &[name, record] : m_shadow)
@@ -125,7 +128,7 @@ void AccountStore::buildIndexes()
 
 bool AccountStore::getUserInfo(const QByteArray &name, AccountRecord &record) const
 {
-    const AccountRecord *found = m_passwdIndex.value(name);
+    const AccountRecord *found = findAccount(name);
     if (!found)
         return false;
     record = *found;
@@ -134,7 +137,7 @@ bool AccountStore::getUserInfo(const QByteArray &name, AccountRecord &record) co
 
 const AccountRecord *AccountStore::findAccount(const QByteArray &name) const
 {
-    return m_passwdIndex.value(name);
+    return m_passwdFilter.mayContain(name) ? m_passwdIndex.value(name) : nullptr;
 }
 
 QByteArray AccountStore::shadowPassword(const QByteArray &name) const
@@ -163,7 +166,7 @@ uint32_t AccountStore::firstUserId() const
 
 bool AccountStore::isSystemUser(const QByteArray &name) const
 {
-    const AccountRecord *account = m_passwdIndex.value(name);
+    const AccountRecord *account = findAccount(name);
     return account && isSystemAccount(*account);
 }
 
@@ -188,7 +191,7 @@ bool AccountStore::isBadPassword(const QByteArray &name) const
 QList<QByteArray> AccountStore::userGroups(const QByteArray &name) const
 {
     QList<QByteArray> result = m_supplementaryGroups.value(name);
-    const AccountRecord *account = m_passwdIndex.value(name);
+    const AccountRecord *account = findAccount(name);
     if (!account)
         return result;
     const auto primary = m_groups.find(account->gid);
@@ -206,7 +209,7 @@ bool AccountStore::isUserInGroup(const QByteArray &name, const QByteArray &group
     const auto supplementary = m_supplementaryGroups.constFind(name);
     if (supplementary != m_supplementaryGroups.constEnd() && supplementary->contains(groupName))
         return true;
-    const AccountRecord *account = m_passwdIndex.value(name);
+    const AccountRecord *account = findAccount(name);
     if (!account)
         return false;
     const auto primary = m_groups.find(account->gid);

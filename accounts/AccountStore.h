@@ -1,6 +1,7 @@
 #pragma once
 
 #include "VirtualUserDb.h"
+#include "common/NameFilter.h"
 #include "common/RootDirectory.h"
 
 #include <QByteArray>
@@ -117,6 +118,7 @@ private:
     // beside the ordered maps keeps that off the tree walks. The maps never
     // change after loading, so the pointers stay valid.
     QHash<QByteArray, const AccountRecord *> m_passwdIndex;
+    NameFilter m_passwdFilter; // in front of the index
     QHash<QByteArray, const AccountRecord *> m_shadowIndex;
     std::map<QByteArray, VirtualUserRecord> m_virtualUsers;
     QSet<QByteArray> m_virtualNames; // the keys of m_virtualUsers

@@ -182,7 +182,11 @@ void LoginForecast::checkServer()
     if (m_settings.isYes("userlist_enable", false)) {
         m_userlistFile = m_settings.value("userlist_file", "/etc/vsftpd.user_list");
         m_userlist = readNames(root.resolve(text(m_userlistFile)));
-        if (!m_userlist) {
+        if (m_userlist) {
+            m_userlistFilter.reset(m_userlist->size());
+            for (const QByteArray &name : *m_userlist)
+                m_userlistFilter.add(name);
+        } else {
             error(m_mainPath, m_settings.line("userlist_file"),
                   QStringLiteral("userlist_enable is on, but %1 cannot be read: vsftpd ends every connection")
                       .arg(text(m_userlistFile)));
@@ -392,7 +396,7 @@ UserForecast LoginForecast::withTls(UserForecast session, bool anonymous) const
 
 bool LoginForecast::isListed(const QByteArray &login) const
 {
-    return m_userlist && m_userlist->contains(login);
+    return m_userlist && m_userlistFilter.mayContain(login) && m_userlist->contains(login);
 }
 
 const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
@@ -417,13 +421,16 @@ const VsftpdSettings *LoginForecast::userSettings(const QByteArray &login)
             while (const dirent *entry = ::readdir(listed))
                 m_userFileNames->insert(QByteArray(entry->d_name));
             ::closedir(listed);
+            m_userFileFilter.reset(m_userFileNames->size());
+            for (const QByteArray &name : *m_userFileNames)
+                m_userFileFilter.add(name);
         } else {
             m_userFileNames.reset();
         }
     }
     // A directory that cannot be listed is tried name by name; a name it
     // does not hold has no file, and nothing to remember.
-    if (m_userFileNames && !m_userFileNames->contains(login))
+    if (m_userFileNames && (!m_userFileFilter.mayContain(login) || !m_userFileNames->contains(login)))
         return nullptr;
     auto it = m_userFiles.find(login);
     if (it == m_userFiles.end()) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "common/NameFilter.h"
 #include "config/ConfigFile.h"
 #include "forecast/VsftpdSettings.h"
 
@@ -88,6 +89,7 @@ private:
     bool m_serverFails = false;
     QByteArray m_userlistFile;
     std::optional<QSet<QByteArray>> m_userlist;
+    NameFilter m_userlistFilter;
     QByteArray m_chrootListFile;
     // The lines of banned_email_file when deny_email_enable is on.
     QList<QByteArray> m_bannedEmails;
@@ -98,6 +100,7 @@ private:
     // The names in user_config_dir, listed when the first user is looked
     // up; none when it cannot be listed.
     std::optional<QSet<QByteArray>> m_userFileNames;
+    NameFilter m_userFileFilter;
     bool m_userFileNamesRead = false;
 };
 

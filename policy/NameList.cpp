@@ -4,8 +4,12 @@ NameList::NameList(const QStringList &names)
     : m_names(names)
 {
     m_index.reserve(names.size());
-    for (const QString &name : names)
-        m_index.insert(name.toUtf8());
+    m_filter.reset(names.size());
+    for (const QString &name : names) {
+        const QByteArray utf8 = name.toUtf8();
+        m_index.insert(utf8);
+        m_filter.add(utf8);
+    }
 }
 
 const QStringList &NameList::names() const
@@ -15,12 +19,12 @@ const QStringList &NameList::names() const
 
 bool NameList::contains(const QString &name) const
 {
-    return m_index.contains(name.toUtf8());
+    return contains(name.toUtf8());
 }
 
 bool NameList::contains(const QByteArray &name) const
 {
-    return m_index.contains(name);
+    return m_filter.mayContain(name) && m_index.contains(name);
 }
 
 bool NameList::isEmpty() const
@@ -36,7 +40,9 @@ int NameList::size() const
 void NameList::append(const QString &name)
 {
     m_names.append(name);
-    m_index.insert(name.toUtf8());
+    const QByteArray utf8 = name.toUtf8();
+    m_index.insert(utf8);
+    m_filter.add(utf8);
 }
 
 int NameList::removeAll(const QString &name)
@@ -49,6 +55,7 @@ void NameList::clear()
 {
     m_names.clear();
     m_index.clear();
+    m_filter = NameFilter();
 }
 
 QString NameList::join(QChar separator) const

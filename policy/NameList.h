@@ -1,5 +1,7 @@
 #pragma once
 
+#include "common/NameFilter.h"
+
 #include <QByteArray>
 #include <QSet>
 #include <QString>
@@ -32,4 +34,5 @@ public:
 private:
     QStringList m_names;
     QSet<QByteArray> m_index; // UTF-8
+    NameFilter m_filter; // in front of the index
 };
