@@ -188,18 +188,24 @@ bool AccountStore::isBadPassword(const QByteArray &name) const
     return false;
 }
 
-QList<QByteArray> AccountStore::userGroups(const QByteArray &name) const
+const QByteArray *AccountStore::primaryGroupName(const QByteArray &name) const
 {
-    QList<QByteArray> result = m_supplementaryGroups.value(name);
     const AccountRecord *account = findAccount(name);
     if (!account)
-        return result;
+        return nullptr;
     const auto primary = m_groups.find(account->gid);
     if (primary == m_groups.end()) {
         std::cerr << "Warning: user has gid=" << account->gid << ", but such group could not be found" << std::endl;
-        return result;
+        return nullptr;
     }
-    result.append(primary->second.name);
+    return &primary->second.name;
+}
+
+QList<QByteArray> AccountStore::userGroups(const QByteArray &name) const
+{
+    QList<QByteArray> result = m_supplementaryGroups.value(name);
+    if (const QByteArray *primary = primaryGroupName(name))
+        result.append(*primary);
     return result;
 }
 
@@ -209,15 +215,8 @@ bool AccountStore::isUserInGroup(const QByteArray &name, const QByteArray &group
     const auto supplementary = m_supplementaryGroups.constFind(name);
     if (supplementary != m_supplementaryGroups.constEnd() && supplementary->contains(groupName))
         return true;
-    const AccountRecord *account = findAccount(name);
-    if (!account)
-        return false;
-    const auto primary = m_groups.find(account->gid);
-    if (primary == m_groups.end()) {
-        std::cerr << "Warning: user has gid=" << account->gid << ", but such group could not be found" << std::endl;
-        return false;
-    }
-    return primary->second.name == groupName;
+    const QByteArray *primary = primaryGroupName(name);
+    return primary && *primary == groupName;
 }
 
 int AccountStore::groupIdByName(const QByteArray &groupName) const

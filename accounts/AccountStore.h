@@ -95,6 +95,9 @@ public:
     VirtualUserDb *database() const;
 
 private:
+    // The name of the user's primary group; none for no account, or a gid
+    // no group has (said on standard error).
+    const QByteArray *primaryGroupName(const QByteArray &name) const;
     void loadPasswd();
     void loadShadow();
     void loadGroups();
